@@ -1,0 +1,22 @@
+# Compiler settings that every target of the project takes: warnings are errors; usual hardening; sanitizers on request.
+add_library(tether_options INTERFACE)
+
+target_compile_options(tether_options INTERFACE
+  -Wall -Wextra -Wpedantic -Werror -Wshadow -Wcast-qual -Wconversion -Wno-sign-conversion -Wformat=2
+  -fstack-protector-strong
+  $<$<COMPILE_LANGUAGE:CXX>:-Wold-style-cast -Wnon-virtual-dtor>)
+
+if(TETHER_SANITIZE)
+  target_compile_options(tether_options INTERFACE
+    -fsanitize=${TETHER_SANITIZE} -fno-sanitize-recover=all -fno-omit-frame-pointer)
+  target_link_options(tether_options INTERFACE -fsanitize=${TETHER_SANITIZE})
+elseif(CMAKE_BUILD_TYPE STREQUAL "Release")
+  target_compile_options(tether_options INTERFACE -U_FORTIFY_SOURCE -D_FORTIFY_SOURCE=2)
+endif()
+
+if(CMAKE_SYSTEM_NAME STREQUAL "Linux" AND NOT TETHER_SANITIZE)
+  target_link_options(tether_options INTERFACE -Wl,-z,relro,-z,now)
+endif()
+
+include(CheckPIESupported)
+check_pie_supported()

@@ -1,0 +1,26 @@
+// The process: started once, ended in one place.
+#pragma once
+
+#include <functional>
+#include <memory>
+
+namespace platform {
+
+class Application {
+ public:
+  static Application& shared();
+
+  // Ends the process, with status 0, from the main thread: delivers kApplicationWillTerminateNotification, waits up to
+  // a second for a write to standard output in progress on another thread, and leaves. No destructor runs, so threads
+  // may go on until the last moment. SIGTERM and SIGINT come here too, from the main run loop.
+  [[noreturn]] void terminate();
+
+ private:
+  Application() = default;
+};
+
+// Turns the calling thread into the application's main thread: makes the main interface with `load`, keeps it, and runs
+// the main run loop until the application terminates. Ignores SIGPIPE. Returns only if the loop is stopped.
+int applicationMain(int argc, char** argv, const std::function<std::shared_ptr<void>()>& load);
+
+}  // namespace platform

@@ -1,0 +1,86 @@
+#include "Thread.h"
+
+#include <pthread.h>
+
+#include <thread>
+
+namespace platform {
+namespace {
+
+std::atomic<int> lastNumber{0};
+thread_local std::shared_ptr<Thread> currentThread;
+
+}  // namespace
+
+Thread::Thread(std::function<void()> body) : _number(++lastNumber), _body(std::move(body)) {}
+
+std::shared_ptr<Thread> Thread::make(std::function<void()> body) {
+  return std::shared_ptr<Thread>(new Thread(std::move(body)));
+}
+
+std::shared_ptr<Thread> Thread::current() {
+  if (!currentThread) {
+    currentThread = make(nullptr);
+    currentThread->_runLoop = RunLoop::current();
+  }
+  return currentThread;
+}
+
+void Thread::start() {
+  std::thread([self = shared_from_this()] { self->main(); }).detach();
+}
+
+void Thread::main() {
+  currentThread = shared_from_this();
+  {
+    std::lock_guard guard(_lock);
+    _runLoop = RunLoop::current();
+    _changed.notify_all();
+  }
+  _body();
+  _body = nullptr;
+  RunLoop::endCurrent();
+  std::lock_guard guard(_lock);
+  _finished = true;
+  _changed.notify_all();
+}
+
+void Thread::cancel() {
+  _cancelled = true;
+  std::shared_ptr<RunLoop> loop;
+  {
+    std::lock_guard guard(_lock);
+    loop = _runLoop;
+  }
+  if (loop) loop->wakeUp();
+}
+
+void Thread::join() {
+  std::unique_lock guard(_lock);
+  _changed.wait(guard, [&] { return _finished; });
+}
+
+std::shared_ptr<RunLoop> Thread::runLoop() {
+  std::unique_lock guard(_lock);
+  _changed.wait(guard, [&] { return _runLoop != nullptr; });
+  return _runLoop;
+}
+
+void Thread::setCurrentName(const std::string& name) {
+  // The system keeps 15 characters; description() has them all.
+#if defined(__APPLE__)
+  pthread_setname_np(name.c_str());
+#else
+  pthread_setname_np(pthread_self(), name.substr(0, 15).c_str());
+#endif
+  const auto self = current();
+  std::lock_guard guard(self->_lock);
+  self->_name = name;
+}
+
+std::string Thread::description() const {
+  std::lock_guard guard(_lock);
+  return "<thread " + std::to_string(_number) + (_name.empty() ? ">" : ": " + _name + ">");
+}
+
+}  // namespace platform

@@ -1,0 +1,51 @@
+// A thread with a name, a cancel flag and a run loop. A running thread keeps its object alive.
+#pragma once
+
+#include <atomic>
+#include <condition_variable>
+#include <functional>
+#include <memory>
+#include <mutex>
+#include <string>
+
+#include "RunLoop.h"
+
+namespace platform {
+
+class Thread : public std::enable_shared_from_this<Thread> {
+ public:
+  static std::shared_ptr<Thread> make(std::function<void()> body);
+  // The calling thread; one that was not made here is adopted.
+  static std::shared_ptr<Thread> current();
+
+  // Throws std::system_error when the system has no thread to give. Once only.
+  void start();
+  // Asks the thread to end; its body looks when it likes. Also ends a wait of its run loop.
+  void cancel();
+  bool isCancelled() const { return _cancelled; }
+  // Waits until the body has returned and the thread's run loop has ended. Not from the thread itself.
+  void join();
+
+  // The thread's run loop; waits for a thread that was started to get that far.
+  std::shared_ptr<RunLoop> runLoop();
+
+  // Names the calling thread.
+  static void setCurrentName(const std::string& name);
+  // Number and name, for log lines.
+  std::string description() const;
+
+ private:
+  explicit Thread(std::function<void()> body);
+  void main();
+
+  const int _number;
+  std::function<void()> _body;
+  std::atomic<bool> _cancelled{false};
+  mutable std::mutex _lock;
+  std::condition_variable _changed;
+  std::string _name;
+  std::shared_ptr<RunLoop> _runLoop;
+  bool _finished = false;
+};
+
+}  // namespace platform

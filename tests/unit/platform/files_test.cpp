@@ -1,0 +1,141 @@
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <array>
+#include <csignal>
+#include <cstdlib>
+#include <filesystem>
+#include <thread>
+
+#include "Bundle.h"
+#include "FileHandle.h"
+#include "FileManager.h"
+#include "NotificationCenter.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+using platform::Clock;
+using platform::FileHandle;
+using platform::FileManager;
+using platform::RunLoop;
+
+struct Pipe {
+  Pipe() {
+    std::array<int, 2> ends{};
+    EXPECT_EQ(pipe(ends.data()), 0);
+    reading = std::make_unique<FileHandle>(ends[0]);
+    writing = std::make_unique<FileHandle>(ends[1]);
+  }
+  std::unique_ptr<FileHandle> reading;
+  std::unique_ptr<FileHandle> writing;
+};
+
+TEST(FileHandle, ABackgroundReadReportsWhatThereIsAndThenTheEnd) {
+  Pipe pipe;
+  std::vector<std::string> chunks;
+  auto observer = platform::NotificationCenter::defaultCenter().addObserver(
+      std::string(platform::kFileHandleReadCompletionNotification), pipe.reading.get(), [&](const auto& notification) {
+        chunks.emplace_back(notification.data->bytes(), notification.data->length());
+        if (!chunks.back().empty()) pipe.reading->readInBackgroundAndNotify();
+      });
+  pipe.reading->readInBackgroundAndNotify();
+  EXPECT_EQ(pipe.writing->write("one", 3), 0);
+  while (chunks.empty()) RunLoop::current()->runOnce(Clock::now() + 1s);
+  EXPECT_EQ(pipe.writing->write("two", 3), 0);
+  pipe.writing.reset();
+  while (chunks.size() < 3) RunLoop::current()->runOnce(Clock::now() + 1s);
+  EXPECT_EQ(chunks, (std::vector<std::string>{"one", "two", ""}));
+}
+
+TEST(FileHandle, WritesFromTwoThreadsStayWholeAlsoThroughAFullNonBlockingPipe) {
+  Pipe pipe;
+  fcntl(pipe.writing->descriptor(), F_SETFL, O_NONBLOCK);
+  constexpr std::size_t kLength = 200000;
+  const auto send = [&](char letter) {
+    const std::string bytes(kLength, letter);
+    EXPECT_EQ(pipe.writing->write(bytes.data(), bytes.size()), 0);
+  };
+  std::thread first(send, 'a');
+  std::thread second(send, 'b');
+  std::string got;
+  std::array<char, 4096> chunk{};
+  while (got.size() < 2 * kLength) {
+    const ssize_t count = read(pipe.reading->descriptor(), chunk.data(), chunk.size());
+    ASSERT_GT(count, 0);
+    got.append(chunk.data(), static_cast<std::size_t>(count));
+  }
+  first.join();
+  second.join();
+  EXPECT_EQ(got.find_first_not_of(got.front()), kLength);
+}
+
+TEST(FileHandle, AWriteToAClosedPipeReportsItsError) {
+  std::signal(SIGPIPE, SIG_IGN);
+  Pipe pipe;
+  pipe.reading.reset();
+  EXPECT_EQ(pipe.writing->write("x", 1), EPIPE);
+}
+
+TEST(Paths, AreTakenApartAndJoined) {
+  using namespace platform;
+  EXPECT_EQ(deletingLastPathComponent("/a/b.c"), "/a");
+  EXPECT_EQ(deletingLastPathComponent("/b"), "/");
+  EXPECT_EQ(deletingLastPathComponent("b"), "");
+  EXPECT_EQ(lastPathComponent("/a.d/b"), "b");
+  EXPECT_EQ(pathExtension("/a.d/b"), "");
+  EXPECT_EQ(pathExtension("x.tar.gz"), "gz");
+  EXPECT_EQ(pathExtension("/a/.hidden"), "");
+  EXPECT_EQ(deletingPathExtension("x.tar.gz"), "x.tar");
+  EXPECT_EQ(deletingPathExtension("/a.d/b"), "/a.d/b");
+  EXPECT_EQ(appendingPathComponent("/", "b"), "/b");
+  EXPECT_EQ(appendingPathComponent("/a/", "b"), "/a/b");
+  EXPECT_EQ(appendingPathComponent("", "b"), "b");
+}
+
+class InFolder : public ::testing::Test {
+ protected:
+  InFolder() {
+    std::string pattern = ::testing::TempDir() + "tether-platform-XXXXXX";
+    folder = mkdtemp(pattern.data());
+  }
+  ~InFolder() override { std::filesystem::remove_all(folder); }
+  std::string folder;
+};
+
+TEST_F(InFolder, ADanglingLinkCountsAsSomethingThere) {
+  const std::string link = folder + "/link";
+  ASSERT_EQ(symlink("/nowhere/at/all", link.c_str()), 0);
+  EXPECT_TRUE(FileManager::exists(link));
+  EXPECT_TRUE(FileManager::remove(link));
+  EXPECT_FALSE(FileManager::exists(link));
+  EXPECT_FALSE(FileManager::remove(link));
+}
+
+TEST_F(InFolder, TheTemporaryDirectoryIsTheNamedOneWhereThereIsOne) {
+  setenv("TMPDIR", (folder + "/").c_str(), 1);
+  EXPECT_EQ(platform::temporaryDirectory(), folder);
+  setenv("TMPDIR", (folder + "/missing").c_str(), 1);
+  EXPECT_TRUE(FileManager::isDirectory(platform::temporaryDirectory()));
+}
+
+TEST_F(InFolder, ABundleNeedsAFolderWithAnExecutableThatLoads) {
+  using platform::Bundle;
+  EXPECT_EQ(Bundle::create(folder + "/Missing.bundle"), nullptr);
+  const std::string code = folder + "/Broken.bundle/Contents/" TETHER_BUNDLE_PLATFORM;
+  std::filesystem::create_directories(code);
+  EXPECT_EQ(Bundle::create(folder + "/Broken.bundle"), nullptr);
+  ASSERT_NE(std::fclose(std::fopen((code + "/AnyName").c_str(), "w")), EOF);
+  const auto broken = Bundle::create(folder + "/Broken.bundle");
+  ASSERT_NE(broken, nullptr);
+  EXPECT_FALSE(broken->loadExecutable());
+  EXPECT_EQ(broken->functionPointer("MAIDEntryPoint"), nullptr);
+}
+
+TEST(Bundle, AnExecutableOutsideABundleHasItsOwnFolderAsMainBundle) {
+  EXPECT_EQ(platform::Bundle::mainBundlePath(), std::filesystem::canonical("/proc/self/exe").parent_path().string());
+}
+
+}  // namespace

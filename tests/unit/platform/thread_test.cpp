@@ -1,0 +1,105 @@
+#include "Thread.h"
+
+#include <gtest/gtest.h>
+
+#include <future>
+#include <thread>
+
+#include "Locks.h"
+#include "Log.h"
+#include "NotificationCenter.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+using platform::NotificationCenter;
+using platform::Thread;
+
+TEST(Thread, DescriptionsTellThreadsApartAndCarryTheWholeName) {
+  const auto thread = Thread::make([] { Thread::setCurrentName("Nikon Download Thread"); });
+  thread->start();
+  thread->join();
+  EXPECT_NE(thread->description().find("Nikon Download Thread"), std::string::npos);
+  EXPECT_NE(thread->description(), Thread::current()->description());
+  EXPECT_EQ(Thread::current(), Thread::current());
+}
+
+TEST(Locks, AreHadWithinTheWaitOrNotAtAll) {
+  platform::TimedLock lock;
+  platform::RecursiveTimedLock recursive;
+  const std::unique_lock held(lock, 1s);
+  const std::unique_lock outer(recursive, 1s);
+  const std::unique_lock inner(recursive, 1s);
+  EXPECT_TRUE(held && outer && inner);
+  std::async(std::launch::async, [&] {
+    EXPECT_FALSE(std::unique_lock(lock, 10ms));
+    EXPECT_FALSE(std::unique_lock(recursive, 10ms));
+  }).get();
+}
+
+TEST(Notifications, ReachObserversByNameAndObjectUntilTheirTokenGoes) {
+  NotificationCenter center;
+  int object = 0;
+  int other = 0;
+  std::string heard;
+  auto byName = center.addObserver("ready", nullptr, [&](const auto&) { heard += 'n'; });
+  auto byObject = center.addObserver("", &object, [&](const auto& notification) {
+    heard += 'o';
+    EXPECT_EQ(notification.object, &object);
+  });
+  center.post({"ready", &object, nullptr});
+  EXPECT_EQ(heard, "no");
+  center.post({"done", &object, nullptr});
+  center.post({"done", &other, nullptr});
+  EXPECT_EQ(heard, "noo");
+  byObject.remove();
+  center.post({"ready", &object, nullptr});
+  EXPECT_EQ(heard, "noon");
+}
+
+TEST(Notifications, AnObserverMayRemoveItselfAndOthersDuringADelivery) {
+  NotificationCenter center;
+  int calls = 0;
+  platform::Observer second;
+  platform::Observer first = center.addObserver("x", nullptr, [&](const auto&) {
+    ++calls;
+    first.remove();
+    second.remove();
+  });
+  second = center.addObserver("x", nullptr, [&](const auto&) { ++calls; });
+  center.post({"x", nullptr, nullptr});
+  center.post({"x", nullptr, nullptr});
+  EXPECT_EQ(calls, 1);
+}
+
+TEST(Notifications, RemovingOnAnotherThreadWaitsForTheDeliveryInProgress) {
+  NotificationCenter center;
+  std::promise<void> entered;
+  std::promise<void> mayLeave;
+  std::atomic<bool> left{false};
+  auto observer = center.addObserver("x", nullptr, [&](const auto&) {
+    entered.set_value();
+    mayLeave.get_future().wait();
+    left = true;
+  });
+  std::thread poster([&] { center.post({"x", nullptr, nullptr}); });
+  entered.get_future().wait();
+  std::thread releaser([&] { mayLeave.set_value(); });
+  observer.remove();
+  EXPECT_TRUE(left);
+  poster.join();
+  releaser.join();
+}
+
+TEST(Log, ASinkGetsTheTextCutToTheLongestLine) {
+  std::string line;
+  platform::setLogSink([&](const std::string& text) { line = text; });
+  platform::log("%s %d", "number", 5);
+  EXPECT_EQ(line, "number 5");
+  platform::log("%s", std::string(10000, 'x').c_str());
+  EXPECT_GT(line.size(), 3000U);
+  EXPECT_LT(line.size(), 4096U);
+  platform::setLogSink(nullptr);
+}
+
+}  // namespace
