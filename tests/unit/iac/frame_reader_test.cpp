@@ -1,0 +1,243 @@
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+#include <array>
+#include <chrono>
+#include <future>
+#include <thread>
+#include <vector>
+
+#include "Hex.h"
+#include "KtRCMessageAccumulator.h"
+#include "Log.h"
+
+using namespace std::chrono_literals;
+using platform::Clock;
+using platform::RunLoop;
+
+struct KtRCMessageAccumulatorTest {
+  static platform::TimedLock& queueLock(KtRCMessageAccumulator& reader) { return reader._messageQueueLock; }
+};
+
+namespace {
+
+const std::string kHeartbeat =
+    bytesFromHex("1a 00 00 00 00 00 00 00 03 00 00 00 0a 00 00 00 68 65 61 72 74 62 65 61 74 00 01 00 00 00");
+
+template <typename Number>
+std::string raw(Number number) {
+  return {reinterpret_cast<const char*>(&number), sizeof number};
+}
+
+// A frame whose length field is `surplus` off.
+std::string frame(std::int32_t id, const std::string& elements, std::int32_t surplus = 0) {
+  return raw(static_cast<std::int32_t>(4 + elements.size()) + surplus) + raw(id) + elements;
+}
+
+const std::string kNil = bytesFromHex("01 00 00 00");
+const std::string kName = bytesFromHex("03 00 00 00 02 00 00 00 61 00");
+
+// A reader on one end of a pipe, and what it announces.
+class FrameReader : public ::testing::Test {
+ protected:
+  FrameReader() {
+    std::array<int, 2> ends{};
+    EXPECT_EQ(pipe(ends.data()), 0);
+    writing = std::make_unique<platform::FileHandle>(ends[1]);
+    reader = std::make_unique<KtRCMessageAccumulator>(std::make_shared<platform::FileHandle>(ends[0]));
+    observer = platform::NotificationCenter::defaultCenter().addObserver(
+        "", reader.get(), [this](const platform::Notification& notification) {
+          (notification.name == kMessageIsAvailable ? available : finished) += 1;
+        });
+    platform::setLogSink([this](const std::string& line) { logged.push_back(line); });
+  }
+  ~FrameReader() override { platform::setLogSink(nullptr); }
+
+  // Hands the bytes over and lets the reader take them in.
+  void feed(const std::string& bytes) {
+    ASSERT_EQ(writing->write(bytes.data(), bytes.size()), 0);
+    RunLoop::current()->runOnce(Clock::now() + 5s);
+  }
+  void feedInChunksOf(std::size_t size, const std::string& bytes) {
+    for (std::size_t from = 0; from < bytes.size(); from += size) feed(bytes.substr(from, size));
+  }
+  std::vector<std::int32_t> takeIds() {
+    std::vector<std::int32_t> ids;
+    while (const auto message = reader->getNextMessage()) ids.push_back(message->id);
+    return ids;
+  }
+
+  std::unique_ptr<platform::FileHandle> writing;
+  std::unique_ptr<KtRCMessageAccumulator> reader;
+  platform::Observer observer;
+  int available = 0;
+  int finished = 0;
+  std::vector<std::string> logged;
+};
+
+TEST_F(FrameReader, AWholeFrameInOneChunkIsOneMessage) {
+  EXPECT_EQ(reader->getNextMessage(), nullptr);
+  feed(kHeartbeat);
+  EXPECT_EQ(available, 1);
+  EXPECT_EQ(reader->accumulatedLength(), 0U);
+  EXPECT_EQ(reader->currentMessageStage(), 0);
+  const auto message = reader->getNextMessage();
+  ASSERT_NE(message, nullptr);
+  EXPECT_EQ(message->id, 0);
+  EXPECT_EQ(message->length, 26);
+  EXPECT_EQ(static_cast<std::string>(*message->name), "heartbeat");
+  EXPECT_EQ(message->data->getType(), kKtLuaTypeNil);
+}
+
+TEST_F(FrameReader, AByteAtATimeItWaitsForTheWholeFrame) {
+  for (std::size_t index = 0; index < kHeartbeat.size(); ++index) {
+    EXPECT_EQ(available, 0) << index;
+    feed(kHeartbeat.substr(index, 1));
+    const bool waits = index >= 3 && index < 29;
+    EXPECT_EQ(reader->currentMessageStage(), waits ? 1 : 0) << index;
+    EXPECT_EQ(reader->accumulatedLength(), waits ? index - 3 : (index + 1) % 30) << index;
+  }
+  EXPECT_EQ(available, 1);
+}
+
+TEST_F(FrameReader, ManyFramesInAnyChunkingComeInOrder) {
+  std::string bytes;
+  std::vector<std::int32_t> ids;
+  for (std::int32_t id = 1; id <= 50; ++id) {
+    bytes += frame(id, kName + kNil);
+    ids.push_back(id);
+  }
+  for (const std::size_t chunk : {std::size_t{1}, std::size_t{7}, std::size_t{23}, bytes.size()}) {
+    feedInChunksOf(chunk, bytes);
+    EXPECT_EQ(takeIds(), ids) << chunk;
+  }
+  EXPECT_EQ(available, 200);
+  feed(kHeartbeat + kHeartbeat.substr(0, 3));
+  EXPECT_EQ(reader->accumulatedLength(), 3U);
+  EXPECT_EQ(reader->currentMessageStage(), 0);
+}
+
+TEST_F(FrameReader, TheFrameEndsWhereItsElementsEndWhateverItsLengthSays) {
+  const std::string longer = frame(1, kName + kNil, 22);  // waits for the 22 bytes of the next frame, then reads them
+  feed(longer);
+  EXPECT_EQ(available, 0);
+  feed(frame(2, kName + kNil));
+  feed(frame(3, kName + kNil, -14));
+  feed(frame(4, kName + kNil, -1000));  // a negative length waits for nothing
+  EXPECT_EQ(takeIds(), (std::vector<std::int32_t>{1, 2, 3, 4}));
+}
+
+TEST_F(FrameReader, AnUnknownTagGivesAMessageWithoutThatElement) {
+  feed(bytesFromHex("0c 00 00 00 05 00 00 00 09 00 00 00 01 00 00 00"));
+  const auto message = reader->getNextMessage();
+  ASSERT_NE(message, nullptr);
+  EXPECT_EQ(message->id, 5);
+  EXPECT_EQ(message->name, nullptr);
+  EXPECT_EQ(message->data->getType(), kKtLuaTypeNil);
+}
+
+TEST_F(FrameReader, AFrameThatCanNeverBeDecodedIsDroppedWithOneLineInAnyChunking) {
+  const std::string negativeData = bytesFromHex("04 00 00 00 ff ff ff ff");
+  const std::string bytes = frame(1, kName + negativeData + std::string(40, 'x')) + frame(2, negativeData) +
+                            frame(3, kName + kNil) + frame(4, kName + bytesFromHex("04 00 00 00 ff ff ff 7f") + "xyz") +
+                            frame(5, kName + kNil);
+  for (const std::size_t chunk : {std::size_t{1}, std::size_t{13}, bytes.size()}) {
+    feedInChunksOf(chunk, bytes);
+    EXPECT_EQ(takeIds(), (std::vector<std::int32_t>{3, 5})) << chunk;
+    EXPECT_EQ(logged.size(), 3U) << chunk;
+    logged.clear();
+  }
+}
+
+TEST_F(FrameReader, AFrameAboveTheLimitIsSkippedAsItArrivesWithoutBeingStored) {
+  const std::int32_t announced = (64 << 20) + 1;
+  feed(raw(announced));
+  EXPECT_EQ(logged.size(), 1U);
+  const std::string chunk(1 << 16, 'x');
+  std::size_t largest = 0;
+  std::thread writer([&] {
+    for (std::int32_t left = announced; left > 0; left -= static_cast<std::int32_t>(chunk.size())) {
+      writing->write(chunk.data(), std::min(chunk.size(), static_cast<std::size_t>(left)));
+    }
+    const std::string good = frame(9, kName + kNil);
+    writing->write(good.data(), good.size());
+  });
+  while (available == 0) {
+    RunLoop::current()->runOnce(Clock::now() + 5s);
+    largest = std::max(largest, reader->accumulatedLength());
+  }
+  writer.join();
+  EXPECT_EQ(takeIds(), (std::vector<std::int32_t>{9}));
+  EXPECT_LT(largest, 100U);
+}
+
+TEST_F(FrameReader, AReaderThatWaitsInsideAFrameDoesNotDecodeItAgainForEveryByte) {
+  // The length field is far too small, so decoding begins with the first bytes of a large data element.
+  const std::int32_t size = 200000;
+  const std::string bytes = frame(1, kName + raw(kKtLuaTypeData) + raw(size) + std::string(size, 'd'), -size);
+  feed(bytes.substr(0, 30));
+  EXPECT_EQ(reader->currentMessageStage(), 3);
+  feedInChunksOf(1000, bytes.substr(30));
+  EXPECT_EQ(takeIds(), (std::vector<std::int32_t>{1}));
+}
+
+TEST_F(FrameReader, TheEndOfTheInputIsToldOnceAndQueuedMessagesStay) {
+  feed(kHeartbeat);
+  writing.reset();
+  RunLoop::current()->runOnce(Clock::now() + 5s);
+  RunLoop::current()->runOnce(Clock::now() + 20ms);
+  EXPECT_EQ(finished, 1);
+  EXPECT_EQ(takeIds().size(), 1U);
+}
+
+TEST_F(FrameReader, AMessageThatMissesTheQueueLockIsQueuedFirstInTheNextPass) {
+  auto& lock = KtRCMessageAccumulatorTest::queueLock(*reader);
+  std::promise<void> held;
+  std::promise<void> release;
+  auto holder = std::async(std::launch::async, [&] {
+    const std::lock_guard guard(lock);
+    held.set_value();
+    release.get_future().wait();
+  });
+  held.get_future().wait();
+  const std::string first = frame(1, kName + kNil);
+  ASSERT_EQ(writing->write(first.data(), first.size()), 0);
+  RunLoop::current()->runOnce(Clock::now() + 5s);  // takes the ten seconds of the wait
+  EXPECT_EQ(available, 0);
+  EXPECT_EQ(reader->currentMessageStage(), 4);
+  ASSERT_EQ(logged.size(), 1U);
+  EXPECT_NE(logged.front().find("Message is being lost because we timed out waiting for the queue lock!"),
+            std::string::npos);
+  release.set_value();
+  holder.get();
+  feed(frame(2, kName + kNil));
+  EXPECT_EQ(takeIds(), (std::vector<std::int32_t>{1, 2}));
+}
+
+TEST(FrameReaderThread, ReadsOnItsOwnThreadUntilTheEndOrUntilItIsDestroyed) {
+  platform::setLogSink([](const std::string&) {});
+  for (const bool closeFirst : {true, false}) {
+    std::array<int, 2> ends{};
+    ASSERT_EQ(pipe(ends.data()), 0);
+    auto writing = std::make_unique<platform::FileHandle>(ends[1]);
+    KtRCMessageAccumulator reader(std::make_shared<platform::FileHandle>(ends[0]), true);
+    std::promise<void> available;
+    std::promise<void> finished;
+    const auto test = std::this_thread::get_id();
+    const auto observer = platform::NotificationCenter::defaultCenter().addObserver(
+        "", &reader, [&](const platform::Notification& notification) {
+          EXPECT_TRUE(std::this_thread::get_id() != test);
+          (notification.name == kMessageIsAvailable ? available : finished).set_value();
+        });
+    writing->write(kHeartbeat.data(), kHeartbeat.size());
+    available.get_future().wait();
+    EXPECT_NE(reader.getNextMessage(), nullptr);
+    if (closeFirst) {
+      writing.reset();
+      finished.get_future().wait();
+    }
+  }
+  platform::setLogSink(nullptr);
+}
+
+}  // namespace

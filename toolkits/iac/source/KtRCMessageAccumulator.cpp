@@ -1,0 +1,206 @@
+#include "KtRCMessageAccumulator.h"
+
+#include <algorithm>
+#include <chrono>
+
+#include "KtNSDataStreamBuf.h"
+#include "Log.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+
+constexpr auto kQueueLockWait = 10s;
+// A buffer that had to grow beyond this is given back once it is empty.
+constexpr std::size_t kBufferToKeep = std::size_t{1} << 20;
+
+}  // namespace
+
+KtRCMessageAccumulator::KtRCMessageAccumulator(std::shared_ptr<platform::FileHandle> source, bool fromOrchard)
+    : _sourceFileHandle(std::move(source)),
+      _accumulatedData(std::make_shared<platform::MutableData>()),
+      _currentMessage(std::make_unique<CRCMessage>()) {
+  if (!fromOrchard) {
+    observePipeForData();
+    return;
+  }
+  // Set before the thread runs: a destruction that comes first must not be overlooked.
+  _keepActiveRunloop = true;
+  _readThread = platform::Thread::make([this] { startReadThread(); });
+  _readThread->start();
+}
+
+KtRCMessageAccumulator::~KtRCMessageAccumulator() {
+  if (_readThread) {
+    _keepActiveRunloop = false;
+    _readThread->cancel();
+    _readThread->join();
+  } else {
+    _readObserver.remove();
+    _sourceFileHandle->stopReading();
+  }
+}
+
+void KtRCMessageAccumulator::observePipeForData() {
+  _readObserver = platform::NotificationCenter::defaultCenter().addObserver(
+      std::string(platform::kFileHandleReadCompletionNotification), _sourceFileHandle.get(),
+      [this](const platform::Notification& notification) { dataWasRead(notification); });
+  _sourceFileHandle->readInBackgroundAndNotify();
+}
+
+void KtRCMessageAccumulator::dataWasRead(const platform::Notification& notification) {
+  if (notification.data->length() == 0) {
+    platform::NotificationCenter::defaultCenter().post({kReadHandleIsFinished, this, nullptr});
+    return;
+  }
+  try {
+    formMessagesWithData(*notification.data);
+  } catch (...) {
+    _sourceFileHandle->readInBackgroundAndNotify();
+    throw;
+  }
+  _sourceFileHandle->readInBackgroundAndNotify();
+}
+
+void KtRCMessageAccumulator::formMessagesWithData(const platform::Data& chunk) {
+  const auto skipped = static_cast<std::size_t>(std::min(_bytesToSkip, static_cast<std::int64_t>(chunk.length())));
+  _bytesToSkip -= static_cast<std::int64_t>(skipped);
+  _accumulatedData->append(chunk.bytes() + skipped, chunk.length() - skipped);
+
+  const auto total = static_cast<std::int64_t>(_accumulatedData->length());
+  if (total < _bytesNeeded) return;
+  _bytesNeeded = 0;
+
+  KtNSDataReadStreamBuf buffer(_accumulatedData);
+  std::istream in(&buffer);
+  Pass pass{in, total, 0};
+  try {
+    while (pass.position < pass.total && step(pass)) {
+      if (_currentMessageStage != kQueue) continue;
+      addMessageToQueue(_currentMessage);
+      startNextMessage();
+    }
+  } catch (const platform::Exception&) {
+    // The bytes ran out, or the queue was not to be had: the next chunk goes on from the same step.
+  } catch (...) {
+    dropConsumedBytes(pass);
+    throw;
+  }
+  dropConsumedBytes(pass);
+}
+
+void KtRCMessageAccumulator::dropConsumedBytes(const Pass& pass) {
+  if (pass.position < pass.total) {
+    if (pass.position > 0) _accumulatedData->removeFront(static_cast<std::size_t>(pass.position));
+  } else if (_accumulatedData->capacity() > kBufferToKeep) {
+    _accumulatedData->release();
+  } else {
+    _accumulatedData->clear();
+  }
+}
+
+bool KtRCMessageAccumulator::step(Pass& pass) {
+  switch (_currentMessageStage) {
+    case kLength:
+      return readLength(pass);
+    case kWholeFrame:
+      return readId(pass);
+    case kName:
+      readElement(pass, _currentMessage->name);
+      return true;
+    case kData:
+      readElement(pass, _currentMessage->data);
+      return true;
+    default:
+      return true;
+  }
+}
+
+bool KtRCMessageAccumulator::readLength(Pass& pass) {
+  pass.in.read(reinterpret_cast<char*>(&_currentMessage->length), sizeof _currentMessage->length);
+  if (pass.in.eof() || pass.in.fail()) return false;
+  pass.position = pass.in.tellg();
+  if (static_cast<std::int64_t>(sizeof _currentMessage->length) + _currentMessage->length > kLargestFrame) {
+    dropFrame(pass, "longer than 64 MiB");
+  } else {
+    _currentMessageStage = kWholeFrame;
+  }
+  return true;
+}
+
+bool KtRCMessageAccumulator::readId(Pass& pass) {
+  if (pass.total - pass.position < _currentMessage->length) return false;
+  pass.in.read(reinterpret_cast<char*>(&_currentMessage->id), sizeof _currentMessage->id);
+  if (pass.in.eof() || pass.in.fail()) return false;
+  pass.position = pass.in.tellg();
+  _frameConsumed = sizeof _currentMessage->id;
+  _currentMessageStage = kName;
+  return true;
+}
+
+void KtRCMessageAccumulator::readElement(Pass& pass, std::unique_ptr<KtLuaTE>& element) {
+  constexpr std::int64_t kLargestRest = kLargestFrame - static_cast<std::int64_t>(sizeof(CRCMessage::length));
+  try {
+    element.reset(KtLuaTE::createFromStream(pass.in));
+    const std::int64_t end = pass.in.tellg();
+    if (_frameConsumed + end - pass.position > kLargestRest) throw KtMalformedElement("runs past 64 MiB");
+    _frameConsumed += end - pass.position;
+    pass.position = end;
+    ++_currentMessageStage;
+  } catch (const KtStreamError& error) {
+    _bytesNeeded = pass.total - pass.position + error.missing();
+    if (_frameConsumed + _bytesNeeded <= kLargestRest) throw;
+    dropFrame(pass, "runs past 64 MiB");
+  } catch (const KtMalformedElement& error) {
+    dropFrame(pass, error.reason().c_str());
+  }
+}
+
+void KtRCMessageAccumulator::dropFrame(Pass& pass, const char* reason) {
+  platform::log("Dropped a frame with length %d: %s", _currentMessage->length, reason);
+  const std::int64_t left = std::max<std::int64_t>(_currentMessage->length - _frameConsumed, 0);
+  const std::int64_t here = std::min(left, pass.total - pass.position);
+  pass.position += here;
+  _bytesToSkip = left - here;
+  pass.in.clear();
+  pass.in.seekg(pass.position);
+  startNextMessage();
+}
+
+void KtRCMessageAccumulator::startNextMessage() {
+  _currentMessage = std::make_unique<CRCMessage>();
+  _currentMessageStage = kLength;
+  _frameConsumed = 0;
+  _bytesNeeded = 0;
+}
+
+void KtRCMessageAccumulator::addMessageToQueue(std::unique_ptr<CRCMessage>& message) {
+  std::unique_lock guard(_messageQueueLock, kQueueLockWait);
+  if (!guard) {
+    platform::AssertionHandler::current().handleFailureInMethod(
+        "addMessageToQueue:", this, "toolkits/iac/source/KtRCMessageAccumulator", 252,
+        "KtRemoteCommunicationMac: addMessageToQueue: Message is being lost because we timed out waiting for the queue "
+        "lock!");
+  }
+  _waitingMessages.push_back(std::move(message));
+  guard.unlock();
+  platform::NotificationCenter::defaultCenter().post({kMessageIsAvailable, this, nullptr});
+}
+
+std::unique_ptr<CRCMessage> KtRCMessageAccumulator::getNextMessage() {
+  const std::unique_lock guard(_messageQueueLock, kQueueLockWait);
+  if (!guard || _waitingMessages.empty()) return nullptr;
+  auto message = std::move(_waitingMessages.front());
+  _waitingMessages.pop_front();
+  return message;
+}
+
+void KtRCMessageAccumulator::startReadThread() {
+  observePipeForData();
+  while (_keepActiveRunloop && platform::RunLoop::current()->runOnce(platform::Clock::time_point::max())) {
+    platform::log("NSRunLoop runs in worker thread to observe data from Pipe");
+  }
+  _readObserver.remove();
+  _sourceFileHandle->stopReading();
+  platform::log("NSRunLoop thread exit.");
+}
