@@ -6,9 +6,12 @@
 #include <array>
 #include <cerrno>
 #include <csignal>
+#include <cstdlib>
+#include <exception>
 #include <mutex>
 
 #include "FileHandle.h"
+#include "Log.h"
 #include "NotificationCenter.h"
 #include "RunLoop.h"
 
@@ -77,9 +80,15 @@ int applicationMain(int /*argc*/, char** /*argv*/, const std::function<std::shar
   fillStandardDescriptors();
   std::signal(SIGPIPE, SIG_IGN);
   const DescriptorWatch signals = watchSignals();
-  const std::shared_ptr<void> mainInterface = load();
+  std::shared_ptr<void> mainInterface;
+  try {
+    mainInterface = load();
+  } catch (const std::exception& exception) {
+    log("The application could not start: %s", exception.what());
+    return EXIT_FAILURE;
+  }
   RunLoop::current()->run();
-  return 0;
+  return EXIT_SUCCESS;
 }
 
 }  // namespace platform

@@ -2,14 +2,78 @@
 //
 //   std::unique_lock guard(lock, 10s);   // waits at most 10 seconds
 //   if (!guard) ...                      // not had
+//
+// They are built from a mutex and a condition, which every sanitizer understands, unlike the system's timed mutexes.
 #pragma once
 
+#include <chrono>
+#include <condition_variable>
 #include <mutex>
+#include <thread>
 
 namespace platform {
 
-using TimedLock = std::timed_mutex;
+class TimedLock {
+ public:
+  void lock() {
+    std::unique_lock guard(_state);
+    _freed.wait(guard, [this] { return !_taken; });
+    _taken = true;
+  }
+  bool try_lock() {
+    std::lock_guard guard(_state);
+    if (_taken) return false;
+    return _taken = true;
+  }
+  template <typename Duration>
+  bool try_lock_for(Duration wait) {
+    std::unique_lock guard(_state);
+    if (!_freed.wait_for(guard, wait, [this] { return !_taken; })) return false;
+    return _taken = true;
+  }
+  void unlock() {
+    std::lock_guard guard(_state);
+    _taken = false;
+    _freed.notify_one();
+  }
+
+ private:
+  std::mutex _state;
+  std::condition_variable _freed;
+  bool _taken = false;
+};
+
 // May be taken again by the thread that holds it; free once it was given back as often.
-using RecursiveTimedLock = std::recursive_timed_mutex;
+class RecursiveTimedLock {
+ public:
+  void lock() {
+    std::unique_lock guard(_state);
+    _freed.wait(guard, [this] { return isFree(); });
+    take();
+  }
+  template <typename Duration>
+  bool try_lock_for(Duration wait) {
+    std::unique_lock guard(_state);
+    if (!_freed.wait_for(guard, wait, [this] { return isFree(); })) return false;
+    take();
+    return true;
+  }
+  void unlock() {
+    std::lock_guard guard(_state);
+    if (--_depth == 0) _freed.notify_one();
+  }
+
+ private:
+  bool isFree() const { return _depth == 0 || _owner == std::this_thread::get_id(); }
+  void take() {
+    _owner = std::this_thread::get_id();
+    ++_depth;
+  }
+
+  std::mutex _state;
+  std::condition_variable _freed;
+  std::thread::id _owner;
+  int _depth = 0;
+};
 
 }  // namespace platform

@@ -34,6 +34,13 @@ struct RunLoop::Waiter {
   }
 };
 
+// Heaps have the greatest in front: the timer that is due first.
+struct RunLoop::Later {
+  bool operator()(const Scheduled& a, const Scheduled& b) const {
+    return std::pair(a.due, a.order) > std::pair(b.due, b.order);
+  }
+};
+
 // A timer whose callback is running; the frames form a stack, innermost first.
 struct RunLoop::Firing {
   std::uint64_t id;
@@ -190,8 +197,13 @@ std::uint64_t RunLoop::schedule(Clock::duration delay, Clock::duration interval,
     order = _nextOrder++;
   }
   const std::uint64_t id = _nextId++;
-  _timers.push_back({Clock::now() + delay, order, id, interval, std::move(call)});
+  insert({Clock::now() + delay, order, id, interval, std::move(call)});
   return id;
+}
+
+void RunLoop::insert(Scheduled timer) {
+  _timers.push_back(std::move(timer));
+  std::push_heap(_timers.begin(), _timers.end(), Later());
 }
 
 void RunLoop::cancel(std::uint64_t id) {
@@ -203,6 +215,7 @@ void RunLoop::cancel(std::uint64_t id) {
   if (found == _timers.end()) return;
   const Call dropped = std::move(found->call);  // what it owns may come back here when it goes
   _timers.erase(found);
+  std::make_heap(_timers.begin(), _timers.end(), Later());
 }
 
 bool RunLoop::hasInputs() {
@@ -211,20 +224,8 @@ bool RunLoop::hasInputs() {
   return !_posted.empty();
 }
 
-std::vector<RunLoop::Scheduled>::iterator RunLoop::earliestTimer(std::uint64_t limit) {
-  auto earliest = _timers.end();
-  for (auto timer = _timers.begin(); timer != _timers.end(); ++timer) {
-    if (timer->order >= limit) continue;
-    if (earliest == _timers.end() || std::pair(timer->due, timer->order) < std::pair(earliest->due, earliest->order)) {
-      earliest = timer;
-    }
-  }
-  return earliest;
-}
-
 void RunLoop::waitForWork(Clock::time_point until) {
-  const auto timer = earliestTimer(std::numeric_limits<std::uint64_t>::max());
-  if (timer != _timers.end()) until = std::min(until, timer->due);
+  if (!_timers.empty()) until = std::min(until, _timers.front().due);
   {
     std::lock_guard guard(_lock);
     if (!_posted.empty()) until = Clock::time_point::min();
@@ -262,15 +263,15 @@ void RunLoop::waitForWork(Clock::time_point until) {
 }
 
 bool RunLoop::runNextDue(Clock::time_point now, std::uint64_t limit) {
-  const auto timer = earliestTimer(limit);
-  const bool timerIsDue = timer != _timers.end() && timer->due <= now;
+  const bool timerIsDue = !_timers.empty() && _timers.front().due <= now && _timers.front().order < limit;
 
   std::unique_lock guard(_lock);
   const bool postedIsDue = !_posted.empty() && _posted.front().order < limit;
   if (!timerIsDue && !postedIsDue) return false;
 
-  if (postedIsDue &&
-      (!timerIsDue || std::pair(_posted.front().due, _posted.front().order) < std::pair(timer->due, timer->order))) {
+  const bool postedIsFirst = postedIsDue && (!timerIsDue || std::pair(_posted.front().due, _posted.front().order) <
+                                                                std::pair(_timers.front().due, _timers.front().order));
+  if (postedIsFirst) {
     Posted posted = std::move(_posted.front());
     _posted.pop_front();
     guard.unlock();
@@ -290,8 +291,9 @@ bool RunLoop::runNextDue(Clock::time_point now, std::uint64_t limit) {
   }
 
   guard.unlock();
-  Scheduled due = std::move(*timer);
-  _timers.erase(timer);
+  std::pop_heap(_timers.begin(), _timers.end(), Later());
+  Scheduled due = std::move(_timers.back());
+  _timers.pop_back();
   fire(std::move(due));
   return true;
 }
@@ -314,7 +316,7 @@ void RunLoop::fire(Scheduled timer) {
     std::lock_guard guard(_lock);
     timer.order = _nextOrder++;
   }
-  _timers.push_back(std::move(timer));
+  insert(std::move(timer));
 }
 
 void RunLoop::runReadyWatches() {

@@ -86,6 +86,7 @@ class RunLoop : public std::enable_shared_from_this<RunLoop> {
     Call call;
   };
   struct Firing;
+  struct Later;
   struct Watch;
 
   RunLoop();
@@ -98,7 +99,7 @@ class RunLoop : public std::enable_shared_from_this<RunLoop> {
   bool runNextDue(Clock::time_point now, std::uint64_t limit);
   void runReadyWatches();
   void fire(Scheduled timer);
-  std::vector<Scheduled>::iterator earliestTimer(std::uint64_t limit);
+  void insert(Scheduled timer);
   bool hasInputs();
 
   // Guarded by _lock: what other threads touch.
@@ -111,7 +112,7 @@ class RunLoop : public std::enable_shared_from_this<RunLoop> {
   int _wakeWrite = -1;
 
   // The own thread's.
-  std::vector<Scheduled> _timers;
+  std::vector<Scheduled> _timers;  // a heap, the earliest first
   std::vector<std::shared_ptr<Watch>> _watches;
   std::uint64_t _nextId = 1;
   Firing* _firing = nullptr;
