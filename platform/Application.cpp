@@ -1,6 +1,7 @@
 #include "Application.h"
 
 #include <fcntl.h>
+#include <poll.h>
 #include <unistd.h>
 
 #include <array>
@@ -9,6 +10,8 @@
 #include <cstdlib>
 #include <exception>
 #include <mutex>
+#include <system_error>
+#include <thread>
 
 #include "FileHandle.h"
 #include "Log.h"
@@ -24,7 +27,9 @@ namespace {
 
 using namespace std::chrono_literals;
 
-constexpr auto kLastWriteWait = 1s;
+// Together less than the two seconds within which the process is gone, whatever it was doing.
+constexpr auto kMainThreadWait = 1200ms;
+constexpr auto kLastWriteWait = 500ms;
 
 int signalWrite = -1;
 
@@ -44,20 +49,41 @@ void fillStandardDescriptors() {
   if (descriptor > STDERR_FILENO) close(descriptor);
 }
 
-DescriptorWatch watchSignals() {
+// Signals are for the watching thread alone: one that holds the main thread up might hold the signal up with it.
+void setSignalMask(int how) {
+  sigset_t mask{};
+  sigemptyset(&mask);
+  for (const int signal : {SIGTERM, SIGINT}) sigaddset(&mask, signal);
+  pthread_sigmask(how, &mask, nullptr);
+}
+
+// Ends the process when a signal or the end of the standard input asks for it. The main thread, which does so itself
+// where it is free to, may be writing to a host that does not read, or be inside a call that does not return.
+void watchForTheEnd(int signals, RunLoop& mainLoop) {
+  setSignalMask(SIG_UNBLOCK);
+  std::array<pollfd, 2> watched{{{signals, POLLIN, 0}, {STDIN_FILENO, 0, 0}}};
+  while (poll(watched.data(), watched.size(), -1) < 0 && errno == EINTR) {
+  }
+  if (watched[0].revents != 0) mainLoop.post([] { Application::shared().terminate(); });
+  std::this_thread::sleep_for(kMainThreadWait);
+  Application::shared().terminate();
+}
+
+void startWatching() {
   std::array<int, 2> ends{};
-  if (pipe(ends.data()) != 0) return {};
+  if (pipe(ends.data()) != 0) throw std::system_error(errno, std::generic_category(), "signal pipe");
   for (const int descriptor : ends) {
     fcntl(descriptor, F_SETFD, FD_CLOEXEC);
     fcntl(descriptor, F_SETFL, fcntl(descriptor, F_GETFL) | O_NONBLOCK);
   }
   signalWrite = ends[1];
+  setSignalMask(SIG_BLOCK);
   struct sigaction action {};
   action.sa_handler = noteSignal;
   action.sa_flags = SA_RESTART;
   sigaction(SIGTERM, &action, nullptr);
   sigaction(SIGINT, &action, nullptr);
-  return DescriptorWatch(ends[0], [] { Application::shared().terminate(); });
+  std::thread([signals = ends[0], mainLoop = RunLoop::current()] { watchForTheEnd(signals, *mainLoop); }).detach();
 }
 
 }  // namespace
@@ -79,9 +105,9 @@ void Application::terminate() {
 int applicationMain(int /*argc*/, char** /*argv*/, const std::function<std::shared_ptr<void>()>& load) {
   fillStandardDescriptors();
   std::signal(SIGPIPE, SIG_IGN);
-  const DescriptorWatch signals = watchSignals();
   std::shared_ptr<void> mainInterface;
   try {
+    startWatching();
     mainInterface = load();
   } catch (const std::exception& exception) {
     log("The application could not start: %s", exception.what());

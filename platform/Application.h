@@ -10,9 +10,12 @@ class Application {
  public:
   static Application& shared();
 
-  // Ends the process, with status 0, from the main thread: delivers kApplicationWillTerminateNotification, waits up to
-  // a second for a write to standard output in progress on another thread, and leaves. No destructor runs, so threads
-  // may go on until the last moment. SIGTERM and SIGINT come here too, from the main run loop.
+  // Ends the process with status 0: delivers kApplicationWillTerminateNotification, waits up to half a second for a
+  // write to standard output in progress on another thread, and leaves. No destructor runs, so threads may go on until
+  // the last moment. For the main thread.
+  //
+  // SIGTERM and SIGINT come here too. Where the main thread is held up, a thread of the application's own comes here in
+  // its place, within two seconds of the signal or of the end of the standard input: observers may be called there.
   [[noreturn]] void terminate();
 
  private:

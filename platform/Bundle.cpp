@@ -38,6 +38,10 @@ Bundle::~Bundle() {
 }
 
 bool Bundle::loadExecutable() {
+  if (!libraryFileIsWhole(_executable)) {
+    log("Loading %s failed: it is no whole library", _executable.c_str());
+    return false;
+  }
   _image = dlopen(_executable.c_str(), RTLD_NOW | RTLD_LOCAL);
   if (_image == nullptr) log("Loading %s failed: %s", _executable.c_str(), dlerror());
   return _image != nullptr;

@@ -9,6 +9,9 @@ namespace platform {
 // The path of the running executable, without links; "" when the system does not tell.
 std::string executablePath();
 
+// Whether everything that the loader would map is in the file. False also for what cannot be read.
+bool libraryFileIsWhole(const std::string& path);
+
 class Bundle {
  public:
   // The folder above Contents/<platform>/<executable>; an executable that stands elsewhere has its own folder.

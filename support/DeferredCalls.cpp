@@ -26,7 +26,7 @@ double currentTime() {
 }
 
 std::shared_ptr<CallDelay> CallDelay::init(void (*proc)(void*), void* param) {
-  const std::shared_ptr<CallDelay> call(new CallDelay(proc, param));
+  std::shared_ptr<CallDelay> call(new CallDelay(proc, param));
   if (queuedDelayedCalls == nullptr) queuedDelayedCalls = new std::vector<std::shared_ptr<CallDelay>>;
   queuedDelayedCalls->push_back(call);
   return call;
