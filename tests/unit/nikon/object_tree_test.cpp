@@ -1,0 +1,146 @@
+#include <gtest/gtest.h>
+
+#include <future>
+
+#include "ModuleLoading.h"
+#include "NikonObject.h"
+#include "Recorder.h"
+
+namespace {
+
+using virtualcamera::Level;
+using virtualcamera::Model;
+using virtualcamera::Picture;
+using virtualcamera::Target;
+
+class ObjectTree : public ::testing::Test {
+ protected:
+  // A module with two cameras, each with one picture, all opened.
+  void openAll() {
+    for (const std::uint32_t id : {1U, 2U}) model.addCamera(id, "Camera").shoot(Picture::jpeg({1, 2, 3}));
+    root = std::make_unique<CNikonObject>(Model::entryPoint(), "module");
+    for (const std::int32_t id : {1, 2}) {
+      CNikonObject* const item = root->openChild(id, "camera")->openChild(1, "item");
+      ASSERT_NE(item->openChild(kNkMAIDDataObjType_Image, "data"), nullptr);
+    }
+  }
+
+  Recorder recorder;
+  Model model;
+  std::unique_ptr<CNikonObject> root;
+};
+
+TEST_F(ObjectTree, ADeletedModuleClosesTheDeepestObjectsFirst) {
+  openAll();
+  EXPECT_EQ(model.openObjects(), 7U);
+  model.record(true);
+  root.reset();
+  const std::vector<Target> expected{{Level::Data, 1, 1},  {Level::Item, 1, 1}, {Level::Camera, 1, 0},
+                                     {Level::Data, 2, 1},  {Level::Item, 2, 1}, {Level::Camera, 2, 0},
+                                     {Level::Module, 0, 0}};
+  EXPECT_EQ(model.closed(), expected);
+  EXPECT_EQ(model.openObjects(), 0U);
+  EXPECT_EQ(recorder.logged("Did acquire lock - ACQLOCK - for deleting CNikonObject: 0x"), 7U);
+  EXPECT_EQ(recorder.logged("Releasing lock - ACQLOCK - for deleting CNikonObject: 0x"), 7U);
+}
+
+TEST_F(ObjectTree, AChildIsOpenedOnceAndLeavesItsParentWhenItIsDeleted) {
+  openAll();
+  model.record(true);
+  CNikonObject* const camera = root->openChild(1, "camera");
+  EXPECT_EQ(camera, root->openChild(1, "camera"));
+  EXPECT_TRUE(model.calls().empty());
+  delete camera;
+  EXPECT_EQ(model.openObjects(), 4U);
+  EXPECT_NE(root->openChild(1, "camera"), nullptr);
+  EXPECT_EQ(model.openObjects(), 5U);
+}
+
+TEST_F(ObjectTree, AFailedOpenReportsTheSdkResultAndLeavesNothing) {
+  root = std::make_unique<CNikonObject>(Model::entryPoint(), "module");
+  EXPECT_EQ(root->openChild(5, "camera"), nullptr);
+  EXPECT_EQ(recorder.traced("Error opening child: "), 1U);
+
+  model.failCall(1, kNkMAIDResult_MissingComponent);
+  EXPECT_EQ(InitializeNikonModule(Model::entryPoint(), "module"), kNkMAIDResult_MissingComponent);
+  EXPECT_EQ(recorder.traced("Error from Command_Open: kNkMAIDResult_MissingComponent"), 1U);
+  EXPECT_EQ(InitializeNikonModule(Model::entryPoint(), "module"), 0);
+  EXPECT_EQ(model.openObjects(), 1U);
+}
+
+TEST_F(ObjectTree, AClosedObjectSendsNothingAndIsNoParent) {
+  openAll();
+  CNikonObject* const camera = root->openChild(1, "camera");
+  camera->closeNikonObject();
+  EXPECT_FALSE(camera->checkObject());
+  model.record(true);
+  camera->closeNikonObject();
+  std::vector<std::int32_t> ids{1, 2};
+  std::int32_t number = 0;
+  std::string text;
+  EXPECT_EQ(camera->enumChildren(), -1);
+  EXPECT_EQ(camera->listChildren(ids), -1);
+  EXPECT_EQ(camera->getIntCapability(kNkMAIDCapability_BatteryLevel, number), -1);
+  EXPECT_EQ(camera->getStringCapability(kNkMAIDCapability_Name, text), -1);
+  EXPECT_EQ(camera->capStart(kNkMAIDCapability_Capture, nullptr, nullptr), -1);
+  EXPECT_FALSE(camera->async());
+  EXPECT_EQ(camera->openChild(2, "item"), nullptr);
+  EXPECT_TRUE(ids.empty());
+  EXPECT_TRUE(model.calls().empty());
+}
+
+TEST_F(ObjectTree, AReplacedChildStaysItsParentsUntilItIsRemoved) {
+  openAll();
+  auto* const second = new SpyObject(root->openChild(2, "camera"), 1);  // the same item once more
+  EXPECT_EQ(root->openChild(2, "camera")->openChild(1, "item"), second);
+  root->openChild(1, "camera")->removeChild(second);  // not that one's child
+  root->removeChild(nullptr);
+  root.reset();
+  EXPECT_EQ(recorder.logged("Releasing lock"), 8U);
+  EXPECT_EQ(model.openObjects(), 0U);
+}
+
+TEST_F(ObjectTree, ChildrenAreListedInTheOrderOfTheSdkAndFailuresEmptyTheList) {
+  openAll();
+  model.faults().add({.level = Level::Module, .times = 2, .children = {{7, 2, 5}}});
+  std::vector<std::int32_t> ids;
+  EXPECT_EQ(root->listChildren(ids), 0);
+  EXPECT_EQ(ids, (std::vector<std::int32_t>{7, 2, 5}));
+  EXPECT_EQ(root->listChildren(ids), 0);
+  EXPECT_EQ(ids, (std::vector<std::int32_t>{1, 2}));
+  EXPECT_EQ(recorder.traced("Children found:"), 2U);
+  EXPECT_EQ(recorder.traced("\t ID: 2"), 2U);
+
+  model.faults().add({.level = Level::Module,
+                      .command = kNkMAIDCommand_CapGetArray,
+                      .times = 1,
+                      .answer = kNkMAIDResult_HardwareError});
+  EXPECT_EQ(root->listChildren(ids), kNkMAIDResult_HardwareError);
+  EXPECT_TRUE(ids.empty());
+  EXPECT_EQ(recorder.traced("Error detected: (-116) kNkMAIDResult_HardwareError"), 1U);
+}
+
+TEST_F(ObjectTree, ADeletionWaitsForAnotherThreadsAndSaysSoEveryThirtySeconds) {
+  root = std::make_unique<CNikonObject>(Model::entryPoint(), "module");
+  std::promise<void> held;
+  std::promise<void> release;
+  auto holder = std::async(std::launch::async, [&] {
+    const std::lock_guard guard(gNikonObjectLock);
+    held.set_value();
+    release.get_future().wait();
+  });
+  held.get_future().wait();
+  auto deleter = std::async(std::launch::async, [&] { root.reset(); });
+  EXPECT_EQ(deleter.wait_for(std::chrono::seconds(31)), std::future_status::timeout);
+  EXPECT_EQ(recorder.logged("*** COULD NOT ACQUIRE LOCK! ACQLOCK  Thread: "), 1U);
+  EXPECT_EQ(model.openObjects(), 1U);
+  release.set_value();
+  deleter.get();
+  EXPECT_EQ(model.openObjects(), 0U);
+}
+
+TEST(ObjectTreeDeathTest, AChildWithoutAParentIsAProgrammingError) {
+  EXPECT_DEATH(CNikonObject(nullptr, 1, "child"), "Assertion failed: \\(parentObject != NULL\\)");
+}
+
+}  // namespace
