@@ -1,0 +1,107 @@
+#include "NikonCamera.h"
+
+#include <memory>
+
+#include "ContentContainer.h"
+#include "DebugTrace.h"
+#include "NameTables.h"
+#include "NikonTetherService.h"
+
+namespace {
+
+struct Setting {
+  const char* key;
+  std::int32_t capability;
+};
+
+constexpr Setting kSettings[] = {
+    {"isoSpeed", kNkMAIDCapability_Sensitivity},     {"batteryLevel", kNkMAIDCapability_BatteryLevel},
+    {"availableShots", kNkMAIDCapability_FreeBytes}, {"aeMode", kNkMAIDCapability_ExposureMode},
+    {"aperture", kNkMAIDCapability_Aperture},        {"shutter", kNkMAIDCapability_ShutterSpeed},
+    {"whiteBalance", kNkMAIDCapability_WBMode},
+};
+
+// Values of SaveMedia.
+constexpr std::uint32_t kSaveToCard = 0;
+constexpr std::uint32_t kSaveToComputer = 1;
+
+}  // namespace
+
+CCamera::CCamera(CNikonObject* module, std::int32_t cameraId)
+    : CNikonObject(module, static_cast<std::uint32_t>(cameraId), "CCamera") {
+  module->addChild(cameraId, this);
+  setCamera(cameraId);
+  openGate();
+}
+
+void CCamera::setCamera(std::int32_t cameraId) {
+  _id = cameraId;
+  const std::int32_t result = getStringCapability(kNkMAIDCapability_Name, _name);
+  if (result != kNkMAIDResult_NoError) throw result;
+}
+
+bool CCamera::isAlive() {
+  bool alive = false;
+  if (getBoolCapability(kNkMAIDCapability_IsAlive, alive) != kNkMAIDResult_NoError) alive = false;
+  debugmsg(alive ? "isAlive(): TRUE" : "isAlive(): FALSE");
+  return alive;
+}
+
+std::int32_t CCamera::connect() {
+  debugDumpCapabilities();
+  std::uint32_t saveMedia = kSaveToCard;
+  const std::int32_t result = getCapability(kNkMAIDCapability_SaveMedia, kNkMAIDDataType_UnsignedPtr,
+                                            reinterpret_cast<std::uintptr_t>(&saveMedia));
+  if (result == kNkMAIDResult_NoError && saveMedia == kSaveToCard) {
+    setCapability(kNkMAIDCapability_SaveMedia, kNkMAIDDataType_Unsigned, kSaveToComputer);
+  }
+  return 0;
+}
+
+void CCamera::doCapture() { issueCommand(kNkMAIDCapability_Capture, this, nullptr); }
+
+void CCamera::completionCallback(std::int32_t command, std::int32_t /*result*/, void* /*context*/) {
+  debugmsgstr("CCamera completion callback for command %s", commandToName(command));
+}
+
+void CCamera::eventNotification(std::int32_t event, void* data) {
+  debugmsgstr("Camera event notification: %s", eventToName(event));
+  if (event == kNkMAIDEvent_AddChild) {
+    handleNewContainer(static_cast<std::int32_t>(reinterpret_cast<std::uintptr_t>(data)));
+  }
+}
+
+void CCamera::handleNewContainer(std::int32_t itemId) {
+  std::unique_ptr<CContentContainer> container;
+  try {
+    container = std::make_unique<CContentContainer>(this, itemId, _downloadId);
+  } catch (std::int32_t result) {
+    debugmsgint("CCamera::handleNewContainer - could not open item, error: %d", result);
+    return;
+  }
+  if (_rawPlusJpegPending && !container->isRawPlusJPEG()) {
+    // The pair's second file never came: that shot is done, this is another one.
+    _rawPlusJpegPending = false;
+    ++_downloadId;
+    container->setDownloadId(_downloadId);
+  }
+  if (_rawPlusJpegPending) {
+    ++_downloadId;
+    _rawPlusJpegPending = false;
+  } else if (container->isRawPlusJPEG()) {
+    _rawPlusJpegPending = true;
+  } else {
+    ++_downloadId;
+  }
+  NikonTetherService::getSingleton()->addItemToDownloadQueue(container.release());
+}
+
+std::int32_t CCamera::makeCameraSettingsMessage(KtLuaTETable*& table) {
+  table = new KtLuaTETable;
+  for (const Setting& setting : kSettings) {
+    std::unique_ptr<KtLuaTE> value = getCapabilityAsTE(setting.capability);
+    if (!value) value = std::make_unique<KtLuaTENil>();
+    table->Set(setting.key, value.release());
+  }
+  return 0;
+}

@@ -1,0 +1,229 @@
+#include "ContentData.h"
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstring>
+#include <mutex>
+
+#include "ContentContainer.h"
+#include "DebugTrace.h"
+#include "FileManager.h"
+#include "Log.h"
+#include "NameTables.h"
+#include "NikonTetherService.h"
+#include "NotificationCenter.h"
+#include "UniqueFilePath.h"
+
+namespace {
+
+// How often a name that was taken between the search for it and the creation of the file is searched anew.
+constexpr int kMostNameTries = 1000;
+
+// Deliveries share the map, the number and the service's count. Not held while calling into the SDK.
+std::mutex& deliveryLock() {
+  static auto* const lock = new std::mutex;
+  return *lock;
+}
+
+// The file that is being received. The process may end at any moment, and what is not whole then must not stay.
+struct UnfinishedFile {
+  std::mutex lock;
+  std::string path;
+  bool processEnds = false;
+  const platform::Observer observer = platform::NotificationCenter::defaultCenter().addObserver(
+      std::string(platform::kApplicationWillTerminateNotification), nullptr, [this](const auto&) {
+        const std::lock_guard guard(lock);
+        processEnds = true;
+        if (!path.empty()) platform::FileManager::remove(path);
+      });
+};
+
+UnfinishedFile& unfinishedFile() {
+  static auto* const file = new UnfinishedFile;
+  return *file;
+}
+
+const char* extensionOf(std::uint32_t fileDataType) {
+  switch (fileDataType) {
+    case kNkMAIDFileDataType_JPEG:
+      return ".jpg";
+    case kNkMAIDFileDataType_TIFF:
+      return ".tif";
+    case kNkMAIDFileDataType_NEF:
+      return ".nef";
+    case kNkMAIDFileDataType_NDF:
+      return ".ndf";
+    default:
+      return ".dat";
+  }
+}
+
+std::uint64_t endOf(const tagNkMAIDFileInfo& info) { return std::uint64_t{info.ulStart} + info.ulLength; }
+
+}  // namespace
+
+std::map<std::int32_t, std::string>& gDownloadIdToNameMap = *new std::map<std::int32_t, std::string>;
+
+std::int32_t CContentData::_fileNumber = 1;
+
+CContentData::CContentData(CContentContainer* container, std::int32_t dataType, std::int32_t downloadId)
+    : CNikonThreadedObject(container, static_cast<std::uint32_t>(dataType), "CContentData"),
+      _container(container),
+      _downloadId(downloadId) {
+  container->addChild(dataType, this);
+  debugDumpCapabilities();
+  std::int32_t result = getIntCapability(kNkMAIDCapability_StoredBytes, _dataSize);
+  if (result != kNkMAIDResult_NoError) {
+    debugmsgint("Error getting kNkMAIDCapability_StoredBytes on data object: %d", result);
+  }
+  std::int32_t status = 0;
+  result = getIntCapability(kNkMAIDCapability_RawJpegImageStatus, status);
+  if (result != kNkMAIDResult_NoError) {
+    debugmsgint("Error getting kNkMAIDCapability_RawJpegImageStatus on data object: %d", result);
+  }
+  _rawPlusJpeg = status != 0;
+  std::string name;
+  getStringCapability(kNkMAIDCapability_Name, name);
+  debugmsgstr("created data for item %s", name.c_str());
+  openGate();
+}
+
+CContentData::~CContentData() {
+  closeGate();
+  giveFileUp();
+}
+
+// A transfer that did not come to its end leaves its file as it is, empty.
+void CContentData::giveFileUp() {
+  if (!_file) return;
+  const std::lock_guard guard(unfinishedFile().lock);
+  unfinishedFile().path.clear();
+  _file.reset();
+  _buffer.reset();
+}
+
+void CContentData::startDownload(const std::string& name) {
+  _fileName = name;
+  issueCommand(kNkMAIDCapability_Acquire, this, nullptr);
+}
+
+// Deliveries.
+
+std::int32_t CContentData::dataCallback_thread(void* dataInfo, void* data) {
+  if (dataInfo == nullptr) return 0;
+  tagNkMAIDFileInfo info{};
+  std::memcpy(&info, dataInfo, sizeof info);
+  if ((info.dataType & kNkMAIDDataObjType_File) == 0) return 0;
+  // No file is that long: the numbers are wrong.
+  if (endOf(info) > UINT32_MAX) return 0;
+
+  const std::lock_guard guard(deliveryLock());
+  if (_finished || _abandoned) return 0;
+  if (!_file) beginFile(info);
+  if (_abandoned) return 0;
+  store(info, data);
+  if (endOf(info) >= info.totalLength) finishFile();
+  return 0;
+}
+
+void CContentData::beginFile(const tagNkMAIDFileInfo& info) {
+  // Without a size of its own the object has the one that comes with its bytes.
+  if (_dataSize == 0) _dataSize = static_cast<std::int32_t>(info.totalLength);
+  if (_fileName.empty()) makeFileName(info.fileDataType);
+  if (!openFile()) {
+    platform::log("Could not create a file for %s: %s", _fileName.c_str(), std::strerror(errno));
+    _abandoned = true;
+    return;
+  }
+  // Zeroed, so that bytes that are never delivered are not what memory held before.
+  const std::size_t size = static_cast<std::uint32_t>(_dataSize);
+  _buffer.reset(static_cast<char*>(std::calloc(size > 0 ? size : 1, 1)));
+  if (!_buffer) {
+    platform::log("No memory for the %zu bytes of %s", size, _fileName.c_str());
+    giveFileUp();
+    platform::FileManager::remove(_path);
+    _abandoned = true;
+    return;
+  }
+  debugmsgstr("path for downloaded file: %s", _path.c_str());
+  _captureId = NikonTetherService::getSingleton()->contentIsReadyToDownload(_fileName, _dataSize, _rawPlusJpeg);
+}
+
+void CContentData::makeFileName(std::uint32_t fileDataType) {
+  std::string& base = gDownloadIdToNameMap[_downloadId];
+  if (base.empty()) {
+    char text[32];
+    std::snprintf(text, sizeof text, "Capture%04d", _fileNumber);
+    ++_fileNumber;
+    base = text;
+  }
+  _fileName = base + extensionOf(fileDataType);
+}
+
+bool CContentData::openFile() {
+  const std::string& directory = NikonTetherService::getSingleton()->getTemporaryDirectoryPath();
+  UnfinishedFile& unfinished = unfinishedFile();
+  const std::lock_guard guard(unfinished.lock);
+  errno = ECANCELED;
+  if (unfinished.processEnds) return false;
+  for (int tries = 0; tries < kMostNameTries; ++tries) {
+    _path = MakeUniqueFilePath(directory, _fileName);
+    // A file of its own: no link is followed, nothing is taken over. Only the owner can read it.
+    const int descriptor = open(_path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600);
+    if (descriptor < 0 && errno == EEXIST) continue;
+    if (descriptor < 0) return false;
+    _file.reset(fdopen(descriptor, "wb"));
+    if (!_file) {
+      close(descriptor);
+      platform::FileManager::remove(_path);
+      return false;
+    }
+    // It is written in one piece; a buffer between would only copy.
+    std::setvbuf(_file.get(), nullptr, _IONBF, 0);
+    unfinished.path = _path;
+    return true;
+  }
+  return false;
+}
+
+void CContentData::store(const tagNkMAIDFileInfo& info, const void* data) {
+  if (data == nullptr || endOf(info) > static_cast<std::uint32_t>(_dataSize)) return;
+  std::memcpy(_buffer.get() + info.ulStart, data, info.ulLength);
+}
+
+void CContentData::finishFile() {
+  const std::size_t size = static_cast<std::uint32_t>(_dataSize);
+  const std::size_t written = std::fwrite(_buffer.get(), 1, size, _file.get());
+  const bool closed = std::fclose(_file.release()) == 0;
+  _buffer.reset();
+  {
+    const std::lock_guard guard(unfinishedFile().lock);
+    _finished = written == size && closed && !unfinishedFile().processEnds;
+    unfinishedFile().path.clear();
+  }
+  if (_finished) return;
+  platform::log("Writing %s failed: %s", _path.c_str(), std::strerror(errno));
+  platform::FileManager::remove(_path);
+  _abandoned = true;
+}
+
+// The end.
+
+void CContentData::completionCallback_thread(std::int32_t command, std::int32_t result, void* /*context*/) {
+  debugmsgstr("CContentData completionCallback: %s", commandToName(command));
+  bool finished = false;
+  {
+    const std::lock_guard guard(deliveryLock());
+    finished = _finished;
+    if (!finished) {
+      debugmsgint("CContentData completionCallback,failed to finish data transfer, err=%ld", result);
+      giveFileUp();
+      _abandoned = true;
+    }
+  }
+  if (finished) NikonTetherService::getSingleton()->fileDownloadComplete(_captureId, _path);
+  closeNikonObject();
+  if (auto* const container = dynamic_cast<CContentContainer*>(parent())) container->contentFinishedDownloading(this);
+}

@@ -1,0 +1,83 @@
+// Shots: how the camera numbers what it announces.
+
+#include "ServiceTest.h"
+
+namespace {
+
+using virtualcamera::Level;
+using virtualcamera::Picture;
+
+TEST_F(ServiceTest, SinglePicturesAreNumberedAndPairsShareAName) {
+  auto& camera = model.addCamera(1, "One");
+  start();
+  camera.shoot(Picture::jpeg(bytes(10)));
+  camera.shootPair(Picture::raw(bytes(30)), Picture::jpeg(bytes(20)));
+  camera.shoot(Picture::jpeg(bytes(10)));
+  idleUntil("fileDownloadComplete", 4);
+  EXPECT_EQ(files(),
+            (std::vector<std::string>{"Capture0001.jpg", "Capture0002.jpg", "Capture0002.nef", "Capture0003.jpg"}));
+  std::vector<double> sidecars;
+  std::vector<double> captureIds;
+  for (std::size_t n = 1; n <= 4; ++n) {
+    const Message added = recorder.await("objectWasAdded", n);
+    sidecars.push_back(added.numbers.at("has_sidecar"));
+    captureIds.push_back(added.numbers.at("capture_id"));
+    EXPECT_EQ(recorder.await("fileDownloadComplete", n).numbers.at("capture_id"), added.numbers.at("capture_id"));
+  }
+  EXPECT_EQ(sidecars, (std::vector<double>{0, 1, 1, 0}));
+  EXPECT_EQ(captureIds, (std::vector<double>{1, 2, 3, 4}));
+}
+
+TEST_F(ServiceTest, APairWhoseSecondFileNeverComesIsOverWithTheNextShot) {
+  auto& camera = model.addCamera(1, "One");
+  start();
+  model.faults().add(
+      {.level = Level::Item, .item = 2, .command = kNkMAIDCommand_Open, .answer = kNkMAIDResult_NoMedia});
+  camera.shootPair(Picture::raw(bytes(30)), Picture::jpeg(bytes(20)));
+  camera.shoot(Picture::jpeg(bytes(11)));
+  camera.shootPair(Picture::raw(bytes(30)), Picture::jpeg(bytes(20)));
+  idleUntil("fileDownloadComplete", 4);
+  EXPECT_EQ(recorder.traced("could not open item, error: -122"), 1U);
+  EXPECT_EQ(files(),
+            (std::vector<std::string>{"Capture0001.nef", "Capture0002.jpg", "Capture0003.jpg", "Capture0003.nef"}));
+}
+
+TEST_F(ServiceTest, TheShutterIsFiredOnTheConnectedCameraAlone) {
+  model.addCamera(1, "One");
+  auto& second = model.addCamera(2, "Two");
+  second.load(Picture::jpeg(bytes(123)));
+  start();
+  service->doCapture(1, nullptr);
+  connect(2, 2);
+  service->doCapture(3, nullptr);
+  idleUntil("fileDownloadComplete");
+  EXPECT_EQ(recorder.await("objectWasAdded").numbers.at("file_size"), 123);
+  EXPECT_EQ(recorder.traced("CCamera completion callback for command kNkMAIDCommand_CapStart"), 1U);
+  EXPECT_EQ(recorder.names(), "deviceAdded deviceAdded ok#2 cameraSettingsChanged objectWasAdded fileDownloadComplete");
+}
+
+TEST_F(ServiceTest, ACameraThatIsNotConnectedDeliversAllTheSameAndOnlyTheEventsOfItemsCount) {
+  auto& camera = model.addCamera(1, "One");
+  start();
+  camera.raise(kNkMAIDEvent_CapChange, kNkMAIDCapability_Aperture);
+  camera.shoot(Picture::jpeg(bytes(5)));
+  idleUntil("fileDownloadComplete");
+  EXPECT_EQ(recorder.traced("Camera event notification: kNkMAIDEvent_CapChange"), 1U);
+  EXPECT_EQ(recorder.names(), "deviceAdded objectWasAdded fileDownloadComplete");
+}
+
+TEST_F(ServiceTest, ACameraThatComesAnewCountsFromOneAgainAndNothingIsOverwritten) {
+  model.addCamera(1, "One").shoot(Picture::jpeg(bytes(5, 1)));
+  start();
+  idleUntil("fileDownloadComplete");
+  model.removeCamera(1);
+  idleUntil("deviceRemoved");
+  model.addCamera(1, "One").shoot(Picture::jpeg(bytes(5, 2)));
+  idleUntil("fileDownloadComplete", 2);
+  EXPECT_EQ(recorder.await("objectWasAdded", 2).strings.at("file_name"), "Capture0001.jpg");
+  EXPECT_EQ(recorder.await("fileDownloadComplete", 2).strings.at("file_path"), folder + "/Capture0001-2.jpg");
+  EXPECT_EQ(read(folder + "/Capture0001.jpg"), bytes(5, 1));
+  EXPECT_EQ(read(folder + "/Capture0001-2.jpg"), bytes(5, 2));
+}
+
+}  // namespace

@@ -1,0 +1,165 @@
+// The download thread: its queue, callbacks carried to it, and cameras that go meanwhile.
+
+#include <future>
+
+#include "ContentContainer.h"
+#include "NikonThreadedObject.h"
+#include "ServiceTest.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+using virtualcamera::Picture;
+
+// A download thread of the test's own.
+class DownloadThreadTest : public ServiceTest {
+ protected:
+  DownloadThreadTest() {
+    thread->start();
+    loop = thread->runLoop();
+    root = std::make_unique<SpyObject>(virtualcamera::Model::entryPoint());
+  }
+  ~DownloadThreadTest() override {
+    root.reset();
+    thread->cancel();
+    thread->join();
+  }
+
+  // Answers from wherever it runs.
+  class Carried : public CNikonThreadedObject {
+   public:
+    Carried(CNikonObject* parentObject, std::int32_t id)
+        : CNikonThreadedObject(parentObject, static_cast<unsigned>(id), "carried") {
+      parentObject->addChild(id, this);
+      openGate();
+    }
+    ~Carried() override { closeGate(); }
+    std::int32_t dataCallback_thread(void*, void*) override {
+      thread = std::this_thread::get_id();
+      return 5;
+    }
+    void eventNotification_thread(std::int32_t event, void*) override {
+      thread = std::this_thread::get_id();
+      lastEvent = event;
+    }
+    void* reference() { return static_cast<CNikonCallbackReceiver*>(this); }
+    std::thread::id thread;
+    std::int32_t lastEvent = -1;
+  };
+
+  NikonDownloadThread downloads;
+  std::shared_ptr<platform::Thread> thread = platform::Thread::make([this] { downloads.threadMain(); });
+  std::shared_ptr<platform::RunLoop> loop;
+  virtualcamera::Camera& camera = model.addCamera(1, "One");
+  std::unique_ptr<SpyObject> root;
+};
+
+TEST_F(DownloadThreadTest, CallbacksAreCarriedToItOnceTheObjectBelongsToIt) {
+  auto* const object = new Carried(root.get(), 1);
+  EXPECT_EQ(MAIDDataHandler(object->reference(), nullptr, nullptr), 5);
+  EXPECT_EQ(object->thread, std::this_thread::get_id());
+
+  object->setDownloadThread(&downloads);
+  EXPECT_EQ(MAIDDataHandler(object->reference(), nullptr, nullptr), 1);
+  EXPECT_NE(object->thread, std::this_thread::get_id());
+  MAIDEventHandler(object->reference(), 4, 0);
+  EXPECT_EQ(object->lastEvent, 4);
+  EXPECT_EQ(recorder.traced("Event Notification"), 0U);
+  loop->perform([&] { EXPECT_EQ(MAIDDataHandler(object->reference(), nullptr, nullptr), 5); });
+}
+
+TEST_F(DownloadThreadTest, ACallbackOnItsWayWhenTheObjectIsDeletedThereFindsNothing) {
+  auto* const object = new Carried(root.get(), 1);
+  object->setDownloadThread(&downloads);
+  std::promise<void> mayGoOn;
+  ASSERT_TRUE(loop->post([&] {
+    mayGoOn.get_future().wait();
+    delete object;  // the delivering thread is waiting for this one
+  }));
+  std::promise<void> started;
+  auto deliverer = std::async(std::launch::async, [&] {
+    started.set_value();
+    return MAIDDataHandler(object->reference(), nullptr, nullptr);
+  });
+  started.get_future().wait();
+  mayGoOn.set_value();
+  EXPECT_EQ(deliverer.get(), 0);
+}
+
+TEST_F(DownloadThreadTest, AnItemIsDeletedWithItsWrapperAndAWrapperEmptiedWithItsItem) {
+  camera.shoot(Picture::jpeg(bytes(5)));
+  CNikonObject* const device = root->openChild(1, "camera");
+  {
+    const auto wrapper = ContentContainerWrapper::wrapperForContentContainer(new CContentContainer(device, 1, 1));
+    EXPECT_EQ(model.openObjects(), 4U);
+  }
+  EXPECT_EQ(model.openObjects(), 2U);
+  const auto wrapper = ContentContainerWrapper::wrapperForContentContainer(new CContentContainer(device, 1, 1));
+  delete device;
+  EXPECT_EQ(wrapper->contentContainer(), nullptr);
+  loop->perform([&] { downloads.addToDownloadQueue(wrapper); });  // skipped
+}
+
+TEST_F(DownloadThreadTest, EndsSoonAfterItIsCancelled) {
+  thread->cancel();
+  thread->join();
+}
+
+TEST_F(ServiceTest, ItemsAreTransferredInTheOrderOfTheirQueueing) {
+  auto& camera = model.addCamera(1, "One");
+  camera.setTransfer({.deliveryBytes = 100});
+  start();
+  for (std::size_t size = 1; size <= 40; ++size) camera.shoot(Picture::jpeg(bytes(size * 10)));
+  idleUntil("fileDownloadComplete", 40);
+  std::vector<double> sizes;
+  std::string order;
+  for (const Message& message : recorder.messages()) {
+    if (message.name == "objectWasAdded") sizes.push_back(message.numbers.at("file_size"));
+    if (message.name != "deviceAdded") order += message.name[0];
+  }
+  EXPECT_TRUE(std::is_sorted(sizes.begin(), sizes.end()));
+  EXPECT_EQ(order.find("oo"), std::string::npos) << "a file began before the one before it was complete";
+}
+
+TEST_F(ServiceTest, ACameraThatGoesWithItemsQueuedAndOneInTransferLeavesNothingBehind) {
+  auto& camera = model.addCamera(1, "One");
+  model.addCamera(2, "Two");
+  camera.setTransfer({.deliveryBytes = 10, .bytesPerSecond = 1000});
+  start();
+  for (int shot = 0; shot < 10; ++shot) camera.shoot(Picture::jpeg(bytes(100000)));
+  idleUntil("objectWasAdded");
+  model.removeCamera(1);
+  idleUntil("deviceRemoved");
+  idle();
+  EXPECT_EQ(model.openObjects(), 2U) << "the module and camera 2";
+  model.camera(2)->shoot(Picture::jpeg(bytes(7)));
+  const Message complete = idleUntil("fileDownloadComplete");
+  EXPECT_EQ(complete.numbers.at("capture_id"), recorder.await("objectWasAdded", 2).numbers.at("capture_id"));
+}
+
+TEST_F(ServiceTest, DeliveriesOnTheMainThreadAreHandledThere) {
+  auto& camera = model.addCamera(1, "One");
+  camera.setTransfer({.deliveryBytes = 10, .inModulePolls = true});
+  start();
+  for (int shot = 0; shot < 20; ++shot) camera.shoot(Picture::jpeg(bytes(995, shot)));
+  idleUntil("fileDownloadComplete", 20);
+  for (std::size_t n = 1; n <= 20; ++n) {
+    EXPECT_EQ(read(recorder.await("fileDownloadComplete", n).strings.at("file_path")),
+              bytes(995, static_cast<int>(n) - 1));
+  }
+}
+
+TEST_F(ServiceTest, TheEndOfTheServiceWaitsForTheTransferAndGivesTheQueueUp) {
+  auto& camera = model.addCamera(1, "One");
+  camera.setTransfer({.deliveryBytes = 1000, .pollsPerDelivery = 10});
+  start();
+  for (int shot = 0; shot < 3; ++shot) camera.shoot(Picture::jpeg(bytes(200000)));
+  idleUntil("objectWasAdded");
+  service.reset();
+  EXPECT_EQ(model.openObjects(), 0U);
+  const auto sent = recorder.messages();
+  ASSERT_GE(sent.size(), 3U);
+  EXPECT_EQ(sent.back().name, "fileDownloadComplete") << "what had begun was brought to its end";
+}
+
+}  // namespace
