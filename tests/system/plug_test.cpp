@@ -1,0 +1,114 @@
+// Cameras that come and go.
+
+#include <algorithm>
+#include <iterator>
+#include <limits>
+#include <string>
+#include <utility>
+
+#include "Helper.h"
+
+namespace tether {
+namespace {
+
+namespace fs = std::filesystem;
+
+class Plug : public HelperTest {
+ protected:
+  void expectNext(const std::string& name, double deviceId) {
+    EXPECT_EQ(helper.await(name).number("device_id"), deviceId) << name;
+  }
+  void expectNoCameraConnected(std::int32_t id) {
+    helper.send(request("getCameraSettings", id, kStudio));
+    EXPECT_EQ(helper.awaitAnswer(id).text("error_description"), "No camera is connected");
+  }
+};
+
+constexpr double kField = 258;
+
+// The fewest of several looks: what is open for a moment does not count.
+std::size_t lasting(pid_t process, const char* folder) {
+  const fs::path path = fs::path("/proc") / std::to_string(process) / folder;
+  std::ptrdiff_t fewest = std::numeric_limits<std::ptrdiff_t>::max();
+  int looks = 0;
+  awaitCondition("look", [&] {
+    fewest = std::min(fewest, std::distance(fs::directory_iterator(path), fs::directory_iterator()));
+    return ++looks == 20;
+  });
+  return static_cast<std::size_t>(fewest);
+}
+
+TEST_F(Plug, EveryCameraIsAnnouncedOnceWhenItComesAndOnceWhenItGoes) {
+  // Ids that do not fit are no cameras.
+  for (const char* name : {"0-None", "256-Far", "257-Farther"}) fs::create_directories(helper.cameras() / name);
+  startWithCamera();
+  connect(kStudio);
+  plugIn("2-Field");
+  expectNext("deviceAdded", kField);
+  helper.send(request("listDevices", 2));
+  unplug("2-Field");
+  expectNext("deviceRemoved", kField);
+  // The other one was not touched.
+  helper.send(request("getCameraSettings", 3, kStudio));
+  EXPECT_EQ(helper.awaitAnswer(3).name, "ok");
+  unplug("1-Studio");
+  expectNext("deviceRemoved", kStudio);
+  expectNoCameraConnected(4);
+  plugIn("1-Studio");
+  expectNext("deviceAdded", kStudio);
+  expectNoCameraConnected(5);
+  connect(kStudio);
+  EXPECT_EQ(helper.count("deviceAdded"), 3U);
+  EXPECT_EQ(helper.count("deviceRemoved"), 2U);
+}
+
+TEST_F(Plug, ACameraUnpluggedInTheMiddleOfATransferWithMoreQueuedTakesNothingWithIt) {
+  startWithCamera(R"({"transfer": {"deliveryBytes": 1000, "bytesPerSecond": 1000}})");
+  connect(kStudio);
+  for (const char* name : {"1.jpg", "2.jpg", "3.jpg"}) drop(studio() / name, pattern(1'000'000, 1));
+  helper.await("objectWasAdded");
+  // While it lasts, settings are not to be had; cameras can still be connected.
+  helper.send(request("getCameraSettings", 2, kStudio) + request("connectDevice", 3, 0x0109));
+  EXPECT_EQ(helper.awaitAnswer(3).name, "error");
+  connect(kStudio);
+  unplug("1-Studio");
+  expectNext("deviceRemoved", kStudio);
+  expectNoCameraConnected(4);
+  helper.await("heartbeat");
+  EXPECT_EQ(helper.count("objectWasAdded"), 1U);
+  EXPECT_EQ(helper.count("fileDownloadComplete"), 0U);
+  for (const Message& message : helper.messages()) EXPECT_NE(message.id, 2);
+
+  // It comes back faster, and with its pictures.
+  drop(helper.folder() / "drawer/1-Studio/camera.json", "{}");
+  plugIn("1-Studio");
+  expectNext("deviceAdded", kStudio);
+  for (int i = 0; i < 3; ++i) {
+    EXPECT_TRUE(readFile(helper.await("fileDownloadComplete").text("file_path")) == pattern(1'000'000, 1));
+  }
+  helper.settle();
+  EXPECT_EQ(helper.count("deviceAdded"), 2U);
+  EXPECT_EQ(helper.count("deviceRemoved"), 1U);
+}
+
+TEST_F(Plug, ComingAndGoingLeavesNoDescriptorAndNoThreadBehind) {
+  if (!fs::exists("/proc/self/task")) GTEST_SKIP() << "no processes to look into";
+  startWithCamera();
+  std::pair<std::size_t, std::size_t> before;
+  for (int round = 0; round < 10; ++round) {
+    connect(kStudio);
+    helper.send(request("doCapture", 2));
+    helper.await("fileDownloadComplete");
+    unplug("1-Studio");
+    expectNext("deviceRemoved", kStudio);
+    helper.settle();
+    const auto now = std::pair(lasting(helper.pid(), "fd"), lasting(helper.pid(), "task"));
+    if (round == 0) before = now;
+    EXPECT_EQ(now, before) << "after round " << round;
+    plugIn("1-Studio");
+    expectNext("deviceAdded", kStudio);
+  }
+}
+
+}  // namespace
+}  // namespace tether
