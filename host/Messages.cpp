@@ -1,0 +1,103 @@
+#include "Messages.h"
+
+#include <cmath>
+#include <cstring>
+#include <ostream>
+
+#include "KtNSDataStreamBuf.h"
+
+namespace tether {
+namespace {
+
+KtLuaTE* valueIn(const KtLuaTE& payload, const char* key) {
+  const auto* const table = dynamic_cast<const KtLuaTETable*>(&payload);
+  return table == nullptr ? nullptr : table->elementForKey(key);
+}
+
+double numberIn(const KtLuaTE& payload, const char* key) {
+  KtLuaTE* const value = valueIn(payload, key);
+  return value == nullptr ? 0.0 : static_cast<double>(*value);
+}
+
+template <class Integer>
+Integer truncated(double value, double largest) {
+  return std::abs(value) <= largest ? static_cast<Integer>(value) : Integer{0};  // a NaN compares false
+}
+
+SettingValue settingFrom(KtLuaTE* value) {
+  if (value == nullptr) return {};
+  if (value->getType() == kKtLuaTypeNumber) return static_cast<double>(*value);
+  if (value->getType() == kKtLuaTypeString) return static_cast<std::string>(*value);
+  return {};
+}
+
+}  // namespace
+
+Message messageFrom(std::unique_ptr<CRCMessage> received) {
+  Message message;
+  message.id = received->id;
+  if (received->name) message.name = static_cast<std::string>(*received->name);
+  message.payload = std::move(received->data);
+  if (!message.payload) message.payload = std::make_shared<KtLuaTENil>();
+  message.size = sizeof received->length + static_cast<std::size_t>(std::max(received->length, 0));
+  return message;
+}
+
+std::int32_t integerIn(const KtLuaTE& payload, const char* key) {
+  return truncated<std::int32_t>(numberIn(payload, key), INT32_MAX);
+}
+
+std::string textIn(const KtLuaTE& payload, const char* key) {
+  KtLuaTE* const value = valueIn(payload, key);
+  return value == nullptr ? std::string() : static_cast<std::string>(*value);
+}
+
+Settings settingsFrom(const KtLuaTE& payload) {
+  Settings settings;
+  for (std::size_t i = 0; i < settings.size(); ++i) settings[i] = settingFrom(valueIn(payload, kSettingNames[i]));
+  return settings;
+}
+
+Event eventFrom(const Message& message) {
+  const KtLuaTE& payload = *message.payload;
+  if (message.id != 0) return OtherMessage{message.name};
+  if (message.name == "heartbeat") return Heartbeat{};
+  if (message.name == "deviceAdded") return DeviceAdded{integerIn(payload, "device_id"), textIn(payload, "name")};
+  if (message.name == "deviceRemoved") return DeviceRemoved{integerIn(payload, "device_id")};
+  if (message.name == "cameraSettingsChanged") return SettingsChanged{settingsFrom(payload)};
+  if (message.name == "objectWasAdded") {
+    constexpr double kLargestExact = 9007199254740992.0;  // 2 to the 53rd
+    return ObjectWasAdded{integerIn(payload, "capture_id"), integerIn(payload, "has_sidecar") != 0,
+                          textIn(payload, "file_name"),
+                          truncated<std::int64_t>(numberIn(payload, "file_size"), kLargestExact)};
+  }
+  if (message.name == "fileDownloadComplete") {
+    return FileDownloadComplete{integerIn(payload, "capture_id"), textIn(payload, "file_path")};
+  }
+  return OtherMessage{message.name};
+}
+
+std::string encodeFrame(std::int32_t id, std::string_view name, const KtLuaTE* payload) {
+  KtNSDataWriteStreamBuf buffer;
+  std::ostream out(&buffer);
+  KtLuaTEString(std::string(name)).writeToStream(out);
+  if (payload != nullptr) {
+    payload->writeToStream(out);
+  } else {
+    KtLuaTENil().writeToStream(out);
+  }
+  const auto body = buffer.getNSData();
+  const auto length = static_cast<std::int32_t>(sizeof id + body->length());
+  std::string frame(sizeof length + sizeof id, '\0');
+  std::memcpy(frame.data(), &length, sizeof length);
+  std::memcpy(frame.data() + sizeof length, &id, sizeof id);
+  return frame.append(body->bytes(), body->length());
+}
+
+std::unique_ptr<KtLuaTETable> devicePayload(std::int32_t device) {
+  auto table = std::make_unique<KtLuaTETable>();
+  table->Set("device_id", new KtLuaTENumber(device));
+  return table;
+}
+
+}  // namespace tether

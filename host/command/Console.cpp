@@ -1,0 +1,80 @@
+#include "Console.h"
+
+#include <sys/ioctl.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdlib>
+#include <string_view>
+
+namespace tether::command {
+namespace {
+
+constexpr std::size_t kUsualWidth = 80;
+
+bool isLiveTerminal() {
+  const char* const kind = std::getenv("TERM");
+  return isatty(STDERR_FILENO) == 1 && kind != nullptr && std::string_view(kind) != "dumb";
+}
+
+bool writeAll(int descriptor, std::string_view text) {
+  while (!text.empty()) {
+    const ssize_t written = write(descriptor, text.data(), text.size());
+    if (written < 0 && errno != EINTR) return false;
+    if (written > 0) text.remove_prefix(static_cast<std::size_t>(written));
+  }
+  return true;
+}
+
+// At most so many characters of UTF-8 text.
+std::string cut(const std::string& text, std::size_t width) {
+  std::size_t characters = 0;
+  for (std::size_t i = 0; i < text.size(); ++i) {
+    const bool begins = (static_cast<unsigned char>(text[i]) & 0xc0U) != 0x80U;
+    if (begins && ++characters > width) return text.substr(0, i);
+  }
+  return text;
+}
+
+}  // namespace
+
+Console::Console(bool json) : _json(json), _live(isLiveTerminal()) {}
+
+Console::~Console() { status(""); }
+
+void Console::result(const std::string& text, const Json& object) {
+  if (_json) {
+    writeLine(object.dump(-1, ' ', false, Json::error_handler_t::replace));
+  } else if (!text.empty()) {
+    writeLine(printable(text));
+  }
+}
+
+void Console::writeLine(std::string line) {
+  const std::lock_guard guard(_lock);
+  replaceStatus("");
+  line += '\n';
+  if (!_closed && !writeAll(STDOUT_FILENO, line)) _closed = true;
+}
+
+void Console::say(const std::string& text) {
+  const std::lock_guard guard(_lock);
+  replaceStatus("");
+  writeAll(STDERR_FILENO, "tether: " + printable(text) + "\n");
+}
+
+void Console::status(const std::string& text) {
+  const std::lock_guard guard(_lock);
+  replaceStatus(text);
+}
+
+void Console::replaceStatus(const std::string& text) {
+  if (!_live || text == _shown) return;
+  winsize size{};
+  const bool known = ioctl(STDERR_FILENO, TIOCGWINSZ, &size) == 0 && size.ws_col > 1;
+  writeAll(STDERR_FILENO, "\r\033[K" + cut(printable(text), known ? size.ws_col - 1U : kUsualWidth - 1));
+  _shown = text;
+}
+
+}  // namespace tether::command

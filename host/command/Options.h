@@ -1,0 +1,39 @@
+// What the command line asks for, and how the command ends.
+#pragma once
+
+#include <chrono>
+#include <optional>
+#include <string>
+
+namespace tether::command {
+
+// Exit statuses.
+inline constexpr int kSuccess = 0;
+inline constexpr int kUnwritable = 1;  // standard output is closed
+inline constexpr int kUsage = 2;
+inline constexpr int kNoCamera = 3;
+inline constexpr int kTimeout = 4;
+inline constexpr int kHelperLost = 5;
+inline constexpr int kNotSaved = 6;
+inline constexpr int kInterrupted = 130;
+
+struct Options {
+  bool json = false;
+  std::string output = ".";
+  std::optional<int> count;
+  std::optional<std::chrono::milliseconds> every;
+  std::optional<std::chrono::milliseconds> timeout;
+  std::string camera;     // id or name; "" for any
+  std::string helper;     // "" for the one beside the command
+  std::string helperLog;  // "" to drop what the helper logs, "-" for standard error
+  std::string send;       // a request to send
+  std::optional<int> device;
+};
+
+// Ends a command with a status and a word to the user, who may already have been told everything ("").
+struct Failure {
+  int status;
+  std::string text;
+};
+
+}  // namespace tether::command

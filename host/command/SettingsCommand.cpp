@@ -1,0 +1,34 @@
+#include "Commands.h"
+#include "Link.h"
+
+namespace tether::command {
+namespace {
+
+constexpr std::size_t kNameWidth = 16;
+
+}  // namespace
+
+int runSettings(const Options& options, Console& console, const std::shared_ptr<Wakeup>& wakeup) {
+  Link link(options, console, wakeup);
+  link.start();
+  const Camera camera = link.choose();
+  link.connect(camera);
+  const Reply reply = link.session().settings(camera.id, Clock::now() + link.timeout());
+  if (reply.kind != Reply::Kind::kOk) link.fail(reply, "reading the settings of " + camera.name);
+
+  const Settings settings = settingsFrom(*reply.payload);
+  Json object = {{"device_id", camera.id}, {"camera", camera.name}};
+  for (std::size_t i = 0; i < settings.size(); ++i) object[kSettingNames[i]] = settingJson(settings[i]);
+  if (console.json()) {
+    console.result("", object);
+    return console.closed() ? kUnwritable : kSuccess;
+  }
+  for (std::size_t i = 0; i < settings.size(); ++i) {
+    std::string name = kSettingNames[i];
+    name.resize(kNameWidth, ' ');
+    console.result(name + settingText(settings[i]), object);
+  }
+  return console.closed() ? kUnwritable : kSuccess;
+}
+
+}  // namespace tether::command

@@ -1,0 +1,82 @@
+// The command `tether`.
+#include <unistd.h>
+
+#include <csignal>
+#include <exception>
+#include <map>
+#include <string_view>
+
+#include "CommandLine.h"
+#include "Commands.h"
+#include "Log.h"
+
+namespace {
+
+using namespace tether;
+using namespace tether::command;
+
+// Who asks this often is not to be kept waiting by anything, a hanging file system included.
+constexpr int kSignalsToLeave = 3;
+
+Wakeup* signalled = nullptr;
+volatile std::sig_atomic_t signals = 0;
+
+void noteSignal(int) {
+  signals = signals + 1;
+  if (signals >= kSignalsToLeave) _exit(kInterrupted);
+  signalled->interrupt();
+}
+
+// A signal that whoever started this wants ignored (nohup, a shell's background job) stays ignored.
+void watchSignals(Wakeup& wakeup) {
+  signalled = &wakeup;
+  std::signal(SIGPIPE, SIG_IGN);
+  for (const int number : {SIGINT, SIGTERM, SIGHUP}) {
+    struct sigaction before {};
+    sigaction(number, nullptr, &before);
+    if (before.sa_handler == SIG_IGN) continue;
+    struct sigaction action {};
+    action.sa_handler = noteSignal;
+    action.sa_flags = SA_RESTART;
+    sigaction(number, &action, nullptr);
+  }
+}
+
+// The frame reader logs every turn of its thread; a dropped frame is worth a word.
+void logOnlyWhatMatters(Console& console) {
+  platform::setLogSink([&console](const std::string& line) {
+    if (line.rfind("NSRunLoop ", 0) != 0) console.say(line);
+  });
+}
+
+int run(const Parsed& parsed, Console& console, const std::shared_ptr<Wakeup>& wakeup) {
+  const std::map<std::string_view, decltype(&runList)> commands = {{"list", runList},
+                                                                   {"settings", runSettings},
+                                                                   {"capture", runCapture},
+                                                                   {"watch", runWatch},
+                                                                   {"messages", runMessages}};
+  try {
+    return commands.at(parsed.subcommand)(parsed.options, console, wakeup);
+  } catch (const Failure& failure) {
+    if (!failure.text.empty()) console.say(failure.text);
+    return failure.status;
+  } catch (const std::exception& problem) {
+    console.say(problem.what());
+    return kHelperLost;
+  }
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  const Parsed parsed = parseCommandLine(argc, argv);
+  if (parsed.subcommand.empty()) return parsed.status;
+  // Never destroyed: a signal may come until the very end.
+  static const auto* const wakeup = new std::shared_ptr<Wakeup>(std::make_shared<Wakeup>());
+  watchSignals(**wakeup);
+  Console console(parsed.options.json);
+  logOnlyWhatMatters(console);
+  const int status = run(parsed, console, *wakeup);
+  platform::setLogSink({});
+  return status;
+}

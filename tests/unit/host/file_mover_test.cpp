@@ -1,0 +1,203 @@
+#include "FileMover.h"
+
+#include <gmock/gmock.h>
+
+#include <cerrno>
+
+#include "Fake.h"
+
+namespace {
+
+using fake::Folder;
+using testing::ElementsAre;
+using testing::HasSubstr;
+using testing::IsEmpty;
+using tether::FileMover;
+
+// A file system that is another one, and whatever else a test breaks in it.
+class Broken : public tether::FileCalls {
+ public:
+  int renameExclusively(const std::string& from, const std::string& to) override {
+    const bool intoFolder = from.find("/.") == std::string::npos;  // not from the hidden name beside
+    if (intoFolder && renameError != 0) return renameError;
+    if (!intoFolder && placeError != 0) return placeError;
+    return FileCalls::renameExclusively(from, to);
+  }
+  int link(const std::string& from, const std::string& to) override {
+    return linkError != 0 ? linkError : FileCalls::link(from, to);
+  }
+  ssize_t write(int descriptor, const void* bytes, std::size_t count) override {
+    if (room < count) {
+      errno = ENOSPC;
+      return -1;
+    }
+    room -= count;
+    return FileCalls::write(descriptor, bytes, std::min(count, longestWrite));
+  }
+  int flush(int descriptor) override { return flushError != 0 ? flushError : FileCalls::flush(descriptor); }
+  int remove(const std::string& path) override {
+    if (beforeRemove) beforeRemove(path);
+    return FileCalls::remove(path);
+  }
+
+  int renameError = EXDEV;
+  int placeError = 0;
+  int linkError = 0;
+  int flushError = 0;
+  std::size_t room = SIZE_MAX / 2;
+  std::size_t longestWrite = SIZE_MAX;
+  std::function<void(const std::string&)> beforeRemove;
+};
+
+class FileMoverTest : public testing::Test {
+ protected:
+  Folder from;
+  Folder to;
+  Broken broken;
+  const std::string content = std::string(3'000'000, 'x') + "end";
+};
+
+TEST_F(FileMoverTest, MovesAFileUnderItsAnnouncedNameWhateverItWasCalledBefore) {
+  FileMover mover(to.path());
+  const auto moved = mover.move(from.write("Capture0001-1.jpg", content), "Capture0001.jpg");
+  EXPECT_TRUE(moved.moved) << moved.description;
+  EXPECT_EQ(moved.path, to / "Capture0001.jpg");
+  EXPECT_EQ(moved.size, 3'000'003);
+  EXPECT_EQ(to.read("Capture0001.jpg"), content);
+  EXPECT_THAT(from.names(), IsEmpty());
+}
+
+TEST_F(FileMoverTest, NeverTakesThePlaceOfAFileAFolderOrALink) {
+  to.write("a.jpg", "old");
+  std::filesystem::create_directory(to / "a-2.jpg");
+  std::filesystem::create_symlink(from / "elsewhere", to / "a-3.jpg");
+  for (const int error : {0, EXDEV, EINVAL}) {
+    broken.renameError = error;
+    FileMover mover(to.path(), &broken);
+    EXPECT_TRUE(mover.move(from.write("a.jpg", "new"), "a.jpg").moved);
+  }
+  EXPECT_THAT(to.names(), ElementsAre("a-2.jpg", "a-3.jpg", "a-4.jpg", "a-5.jpg", "a-6.jpg", "a.jpg"));
+  EXPECT_EQ(to.read("a.jpg"), "old");
+  EXPECT_THAT(from.names(), IsEmpty());  // nothing was written through the link either
+}
+
+TEST_F(FileMoverTest, WorksWhereTheFileSystemKnowsNeitherExclusiveRenamesNorLinks) {
+  broken.renameError = EINVAL;
+  broken.placeError = EINVAL;
+  broken.linkError = EPERM;
+  FileMover mover(to.path(), &broken);
+  EXPECT_TRUE(mover.move(from.write("a.jpg", content), "a.jpg").moved);
+  EXPECT_EQ(mover.move(from.write("a.jpg", "second"), "a.jpg").path, to / "a-2.jpg");
+  EXPECT_EQ(to.read("a.jpg"), content);
+  EXPECT_EQ(to.read("a-2.jpg"), "second");
+  EXPECT_THAT(from.names(), IsEmpty());
+}
+
+TEST_F(FileMoverTest, ANameThatLeadsElsewhereIsPutIntoTheFolderAllTheSame) {
+  FileMover mover(to.path());
+  EXPECT_EQ(mover.move(from.write("1", "1"), "../../etc/x.jpg").path, to / "x.jpg");
+  EXPECT_EQ(mover.move(from.write("2", "2"), "..").path, to / "Picture");
+  EXPECT_EQ(mover.move(from.write("3", "3"), "").path, to / "Picture-2");
+  EXPECT_EQ(mover.move(from.write("4", "4"), ".hidden").path, to / ".hidden");
+}
+
+TEST_F(FileMoverTest, AnythingButARegularFileIsRefusedAndLeftAlone) {
+  FileMover mover(to.path());
+  const std::string target = from.write("target", content);
+  std::filesystem::create_symlink(target, from / "link.jpg");
+  EXPECT_FALSE(mover.move(from / "link.jpg", "link.jpg").moved);
+  EXPECT_FALSE(mover.move(from.path(), "folder.jpg").moved);
+  EXPECT_FALSE(mover.move(from / "missing.jpg", "missing.jpg").moved);
+  EXPECT_THAT(from.names(), ElementsAre("link.jpg", "target"));
+  EXPECT_THAT(to.names(), IsEmpty());
+}
+
+TEST_F(FileMoverTest, BothFilesOfAPairGetABaseThatIsFreeForBoth) {
+  to.write("Capture0001.jpg", "an older shot");
+  to.write("Capture0001-2.tif", "another");
+  FileMover mover(to.path());
+  const auto raw = mover.move(from.write("r", "raw"), "Capture0001.nef", true);
+  EXPECT_EQ(raw.path, to / "Capture0001-3.nef");
+  const auto jpeg = mover.move(from.write("j", "jpeg"), "Capture0001.jpg", false, raw.base);
+  EXPECT_EQ(jpeg.path, to / "Capture0001-3.jpg");
+  const auto late = mover.move(from.write("l", "late"), "Capture0001.jpg", false, raw.base);
+  EXPECT_EQ(late.path, to / "Capture0001-3-2.jpg");
+}
+
+TEST_F(FileMoverTest, CopiesIntoAnotherFileSystem) {
+  if (access("/dev/shm", W_OK) != 0) GTEST_SKIP() << "no second file system";
+  const Folder other("/dev/shm");
+  struct stat here {};
+  struct stat there {};
+  ASSERT_EQ(stat(from.path().c_str(), &here), 0);
+  ASSERT_EQ(stat(other.path().c_str(), &there), 0);
+  if (here.st_dev == there.st_dev) GTEST_SKIP() << "no second file system";
+  other.write("a.jpg", "old");
+  FileMover mover(other.path());
+  const auto moved = mover.move(from.write("a.jpg", content), "a.jpg");
+  EXPECT_TRUE(moved.moved) << moved.description;
+  EXPECT_EQ(other.read("a-2.jpg"), content);
+  EXPECT_THAT(other.names(), ElementsAre("a-2.jpg", "a.jpg"));
+  EXPECT_THAT(from.names(), IsEmpty());
+}
+
+TEST_F(FileMoverTest, TheFirstCopyIsRemovedOnlyWhenTheSecondStandsInItsPlace) {
+  broken.longestWrite = 1000;  // short writes are no failure
+  std::string then;
+  broken.beforeRemove = [&](const std::string& path) {
+    if (path == from / "a.jpg") then = to.read("a.jpg");
+  };
+  FileMover mover(to.path(), &broken);
+  EXPECT_TRUE(mover.move(from.write("a.jpg", content), "a.jpg").moved);
+  EXPECT_EQ(then, content);
+  EXPECT_THAT(to.names(), ElementsAre("a.jpg"));
+}
+
+TEST_F(FileMoverTest, WhateverFailsLeavesTheFirstCopyAndNothingInTheFolder) {
+  const std::string source = from.write("a.jpg", content);
+  const auto failsWith = [&](const std::string& text) {
+    FileMover mover(to.path(), &broken);
+    const auto moved = mover.move(source, "a.jpg");
+    EXPECT_FALSE(moved.moved);
+    EXPECT_EQ(moved.path, source);
+    EXPECT_THAT(moved.description, HasSubstr(text));
+    EXPECT_EQ(from.read("a.jpg"), content);
+    EXPECT_THAT(to.names(), IsEmpty());
+    broken = Broken();
+  };
+  broken.room = 2'000'000;
+  failsWith("No space left");
+  broken.flushError = EIO;
+  failsWith("Input/output error");
+  broken.placeError = EROFS;
+  failsWith("Read-only file system");
+  broken.renameError = EROFS;
+  failsWith("Read-only file system");
+}
+
+TEST_F(FileMoverTest, AFolderThatIsGoneLeavesTheFileWhereItIs) {
+  const std::string source = from.write("a.jpg", content);
+  for (const int error : {0, EXDEV, EINVAL}) {
+    broken.renameError = error;
+    FileMover mover(to / "gone", &broken);
+    const auto moved = mover.move(source, "a.jpg");
+    EXPECT_FALSE(moved.moved);
+    EXPECT_THAT(moved.description, HasSubstr("No such file"));
+    EXPECT_EQ(from.read("a.jpg"), content);
+  }
+}
+
+TEST_F(FileMoverTest, APictureMayBeReadByWhomAnyNewFileMay) {
+  FileMover mover(to.path(), nullptr);
+  const std::string source = from.write("a.jpg", content);
+  chmod(source.c_str(), 0600);
+  mover.move(source, "a.jpg");
+  to.write("new", "");
+  struct stat moved {};
+  struct stat fresh {};
+  ASSERT_EQ(stat((to / "a.jpg").c_str(), &moved), 0);
+  ASSERT_EQ(stat((to / "new").c_str(), &fresh), 0);
+  EXPECT_EQ(moved.st_mode, fresh.st_mode);
+}
+
+}  // namespace

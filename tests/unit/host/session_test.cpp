@@ -1,0 +1,298 @@
+#include "Session.h"
+
+#include <fcntl.h>
+#include <gmock/gmock.h>
+#include <sys/wait.h>
+
+#include <set>
+
+#include "Fake.h"
+#include "Log.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+using namespace tether;
+using fake::isGone;
+using fake::soon;
+using testing::ElementsAre;
+using testing::HasSubstr;
+using testing::IsEmpty;
+using testing::StartsWith;
+
+class SessionTest : public testing::Test {
+ protected:
+  void SetUp() override {
+    platform::setLogSink([](const std::string&) {});
+  }
+  void TearDown() override {
+    session.reset();
+    platform::setLogSink({});
+  }
+
+  Session& start(const std::string& script, std::chrono::milliseconds silence = fake::kPatience) {
+    helper = std::make_unique<fake::Helper>(script);
+    SessionOptions options;
+    options.helper = fake::Helper::path();
+    options.environment = helper->environment();
+    options.silence = silence;
+    options.wakeup = wakeup;
+    session = std::make_unique<Session>(options);
+    return *session;
+  }
+
+  // The next event of that kind; others are passed over.
+  template <class Kind>
+  Kind next() {
+    for (const auto until = soon(); Clock::now() < until;) {
+      const auto event = session->nextEvent(until);
+      if (event && std::holds_alternative<Kind>(*event)) return std::get<Kind>(*event);
+      if (event && std::holds_alternative<HelperLost>(*event)) break;
+    }
+    ADD_FAILURE() << "no such event";
+    return {};
+  }
+
+  std::shared_ptr<Wakeup> wakeup = std::make_shared<Wakeup>();
+  std::unique_ptr<fake::Helper> helper;
+  std::unique_ptr<Session> session;
+};
+
+TEST_F(SessionTest, NotificationsBecomeTypedEvents) {
+  start(R"({"start": [
+    {"send": "deviceAdded", "payload": {"device_id": 257, "name": "Cam"}},
+    {"send": "deviceRemoved", "payload": {"device_id": 258}},
+    {"send": "cameraSettingsChanged", "payload": {"isoSpeed": 400, "shutter": "1/60", "aperture": null}},
+    {"send": "objectWasAdded",
+     "payload": {"capture_id": 3, "has_sidecar": 1, "file_name": "Capture0001.nef", "file_size": 3000000000}},
+    {"send": "fileDownloadComplete", "payload": {"capture_id": 3, "file_path": "/x/Capture0001.nef"}},
+    {"send": "somethingNew"}, {"send": "deviceAdded", "payload": 5}]})");
+  const auto added = next<DeviceAdded>();
+  EXPECT_EQ(added.device_id, 257);
+  EXPECT_EQ(added.name, "Cam");
+  EXPECT_EQ(next<DeviceRemoved>().device_id, 258);
+  const auto settings = next<SettingsChanged>().settings;
+  EXPECT_EQ(settings[0], SettingValue(400.0));
+  EXPECT_EQ(settings[4], SettingValue());
+  EXPECT_EQ(settings[5], SettingValue("1/60"));
+  const auto object = next<ObjectWasAdded>();
+  EXPECT_EQ(object.capture_id, 3);
+  EXPECT_TRUE(object.has_sidecar);
+  EXPECT_EQ(object.file_name, "Capture0001.nef");
+  EXPECT_EQ(object.file_size, 3'000'000'000);
+  EXPECT_EQ(next<FileDownloadComplete>().file_path, "/x/Capture0001.nef");
+  EXPECT_EQ(next<OtherMessage>().name, "somethingNew");
+  EXPECT_EQ(next<DeviceAdded>().device_id, 0);
+  next<Heartbeat>();
+}
+
+TEST_F(SessionTest, RepliesAreMatchedByIdWhateverTheirOrder) {
+  Session& running = start(R"({"on": {
+    "second": [[{"send": "deviceAdded", "payload": {"device_id": 1, "name": "x"}},
+                {"reply": "ok", "payload": {"isoSpeed": 2}},
+                {"reply": "error", "to": "first", "payload": {"error_code": 65535, "error_description": "No"}}]]}})");
+  const std::int32_t first = running.send("first");
+  const Reply second = running.request("second", nullptr, soon());
+  EXPECT_EQ(second.kind, Reply::Kind::kOk);
+  EXPECT_EQ(settingsFrom(*second.payload)[0], SettingValue(2.0));
+  EXPECT_EQ(next<DeviceAdded>().device_id, 1);  // kept meanwhile
+  for (;;) {
+    const auto message = running.nextMessage(soon());
+    ASSERT_TRUE(message);
+    if (message->name != "error") continue;
+    EXPECT_EQ(message->id, first);
+    EXPECT_EQ(textIn(*message->payload, "error_description"), "No");
+    break;
+  }
+}
+
+TEST_F(SessionTest, AnUnansweredRequestEndsAtItsTimeAndALateReplyIsNobodys) {
+  Session& running = start(R"({"on": {"late": [[]], "now": [[{"reply": "ok", "to": "late"}, {"reply": "ok"}]]}})");
+  EXPECT_EQ(running.request("late", nullptr, Clock::now() + 50ms).kind, Reply::Kind::kTimeout);
+  EXPECT_EQ(running.request("now", nullptr, soon()).kind, Reply::Kind::kOk);
+  EXPECT_EQ(next<OtherMessage>().name, "ok");
+}
+
+TEST_F(SessionTest, ConnectingACameraThatIsConnectedAlreadyIsFoundOutByAsking) {
+  Session& running = start(R"({"on": {"connectDevice": [[{"reply": "ok"}], []],
+                                      "getCameraSettings": [[], [{"reply": "ok", "payload": {"isoSpeed": 1}}]]}})");
+  EXPECT_EQ(running.connect(257, soon()).kind, Reply::Kind::kOk);
+  EXPECT_EQ(running.connect(257, soon()).kind, Reply::Kind::kOk);
+  EXPECT_THAT(helper->notes("request "),
+              ElementsAre("connectDevice 257", "connectDevice 257", "getCameraSettings 257", "getCameraSettings 257"));
+}
+
+TEST_F(SessionTest, SettingsAreAskedForAgainWhenTheHelperDropsTheRequest) {
+  Session& running = start(R"({"on": {"getCameraSettings": [[], [{"reply": "ok", "payload": {"isoSpeed": 9}}]]}})");
+  const Reply reply = running.settings(257, soon());
+  ASSERT_EQ(reply.kind, Reply::Kind::kOk);
+  EXPECT_EQ(settingsFrom(*reply.payload)[0], SettingValue(9.0));
+}
+
+TEST_F(SessionTest, AListingIsCompleteWithTheFirstReplyOrTheFirstHeartbeat) {
+  for (const char* const script :
+       {R"({"heartbeat": 0, "start": [{"pause": 30}, {"send": "deviceAdded", "payload": {"device_id": 513}}],
+            "on": {"getCameraSettings": [[], [{"reply": "error"}]]}})",
+        R"({"heartbeat": 20, "start": [{"pause": 30}, {"send": "deviceAdded", "payload": {"device_id": 513}}]})"}) {
+    EXPECT_EQ(start(script).awaitListing(soon()), Reply::Kind::kOk);
+    const auto event = session->nextEvent(Clock::now());
+    ASSERT_TRUE(event && std::holds_alternative<DeviceAdded>(*event));
+    EXPECT_EQ(std::get<DeviceAdded>(*event).device_id, 513);
+  }
+}
+
+TEST_F(SessionTest, AFrameThatIsNoMessageIsDroppedAndTheNextOneRead) {
+  start(R"({"start": [{"bytes": "160000000000000003000000020000006100" }, {"bytes": "04000000ffffffff"},
+    {"send": "deviceRemoved", "payload": {"device_id": 4}}]})");
+  EXPECT_EQ(next<DeviceRemoved>().device_id, 4);
+}
+
+TEST_F(SessionTest, AHelperThatOnlyEverSendsGarbageCountsAsSilent) {
+  Session& running = start(R"({"start": [{"bytes": "ffffff7f0000"}]})", 300ms);
+  EXPECT_EQ(next<HelperLost>().how, HelperLost::How::kSilent);
+  EXPECT_TRUE(isGone(running.processId()));
+}
+
+TEST_F(SessionTest, AFloodThatNobodyTakesMakesTheHelperWaitAndLosesNothing) {
+  Session& running = start(R"({"heartbeat": 0, "start": [
+    {"repeat": 30000, "do": [{"send": "deviceRemoved", "payload": {"device_id": 1}}]},
+    {"send": "deviceAdded", "payload": {"device_id": 7}}], "on": {"ask": [[{"reply": "ok"}]]}})");
+  helper->process();
+  EXPECT_EQ(running.request("ask", nullptr, soon()).kind, Reply::Kind::kOk);  // behind the flood
+  int removed = 0;
+  for (;; ++removed) {
+    const auto event = running.nextEvent(soon());
+    ASSERT_TRUE(event);
+    if (std::holds_alternative<DeviceAdded>(*event)) break;
+  }
+  EXPECT_EQ(removed, 30000);
+}
+
+TEST_F(SessionTest, WhatCameBeforeTheHelperDiedIsDeliveredBeforeItsLoss) {
+  Session& running = start(R"({"start": [{"send": "deviceAdded", "payload": {"device_id": 7}}, {"exit": 3}]})");
+  EXPECT_EQ(next<DeviceAdded>().device_id, 7);
+  const auto event = running.nextEvent(soon());
+  ASSERT_TRUE(event && std::holds_alternative<HelperLost>(*event));
+  const auto& lost = std::get<HelperLost>(*event);
+  EXPECT_EQ(lost.how, HelperLost::How::kEnded);
+  EXPECT_EQ(WEXITSTATUS(lost.status), 3);
+  EXPECT_THAT(lost.description, HasSubstr("exit status 3"));
+  EXPECT_EQ(running.request("any", nullptr, soon()).kind, Reply::Kind::kLost);
+  EXPECT_TRUE(std::holds_alternative<HelperLost>(*running.nextEvent(soon())));  // and again
+}
+
+TEST_F(SessionTest, AHelperKilledDuringARequestIsLostAtOnce) {
+  Session& running = start(R"({"on": {"ask": [[{"kill": 9}]]}})");
+  EXPECT_EQ(running.request("ask", nullptr, soon()).kind, Reply::Kind::kLost);
+  EXPECT_THAT(running.lost()->description, HasSubstr("signal 9"));
+  EXPECT_TRUE(isGone(running.processId()));
+}
+
+TEST_F(SessionTest, AHelperThatClosesItsOutputIsLostAndEnded) {
+  Session& running = start(R"({"heartbeat": 0, "ignoresEndOfInput": true, "start": [{"closeOutput": true}]})");
+  const auto event = running.nextEvent(soon());
+  ASSERT_TRUE(event && std::holds_alternative<HelperLost>(*event));
+  EXPECT_TRUE(isGone(running.processId()));
+}
+
+TEST_F(SessionTest, ASilentHelperIsLostAndEndedThoughItIgnoresSigterm) {
+  Session& running =
+      start(R"({"heartbeat": 0, "ignoresEndOfInput": true, "start": [{"ignore": 15}, {"send": "heartbeat"}]})", 300ms);
+  next<Heartbeat>();
+  EXPECT_EQ(next<HelperLost>().how, HelperLost::How::kSilent);
+  EXPECT_TRUE(isGone(running.processId()));
+}
+
+TEST_F(SessionTest, AHelperThatDoesNotReadIsLost) {
+  Session& running = start(R"({"heartbeat": 0, "start": [{"ignore": 15}, {"stopReading": true}]})");
+  helper->process();
+  auto large = std::make_unique<KtLuaTETable>();
+  large->Set("text", new KtLuaTEString(std::string(1 << 20, 'x')));
+  running.send("large", large.get());
+  ASSERT_TRUE(running.lost());
+  EXPECT_EQ(running.lost()->how, HelperLost::How::kNotReading);
+  EXPECT_TRUE(isGone(running.processId()));
+}
+
+TEST_F(SessionTest, ShutdownEndsTheHelperAndRemovesItsDirectory) {
+  Session& running = start("{}");
+  const pid_t process = helper->process();
+  const std::string directory = helper->directory();
+  struct stat status {};
+  ASSERT_EQ(stat(directory.c_str(), &status), 0);
+  EXPECT_EQ(status.st_mode & 0777U, 0700U);
+  EXPECT_EQ(running.end(fake::kPatience), 0);
+  EXPECT_TRUE(isGone(process));
+  session.reset();
+  EXPECT_FALSE(std::filesystem::exists(directory));
+  EXPECT_THAT(helper->notes("request"), ElementsAre(" shutdown 0"));
+}
+
+TEST_F(SessionTest, AHelperThatOverhearsEverythingIsKilledInTheEnd) {
+  start(R"({"ignoresEndOfInput": true, "start": [{"ignore": 15}], "on": {"shutdown": [[]]}})");
+  const pid_t process = helper->process();
+  next<Heartbeat>();
+  EXPECT_EQ(WTERMSIG(session->end(50ms)), SIGKILL);
+  EXPECT_TRUE(isGone(process));
+  EXPECT_THAT(helper->notes("end"), ElementsAre(""));  // its input was closed first
+}
+
+TEST_F(SessionTest, WhatTheHelperSendsWhileItEndsCanStillBeTaken) {
+  start(R"({"on": {"shutdown": [[{"picture": "a.jpg"}, {"exit": 0}]]}})").end(fake::kPatience);
+  EXPECT_EQ(next<FileDownloadComplete>().capture_id, 1);
+  EXPECT_EQ(session->directory().tidy(), std::vector<std::string>{session->directory().path() + "/a.jpg"});
+  std::filesystem::remove_all(session->directory().path());
+}
+
+TEST_F(SessionTest, AnInterruptionEndsAWaitAndLeavesTheSessionUsable) {
+  Session& running = start(R"({"heartbeat": 0, "on": {"ask": [[], [{"reply": "ok"}]]}})");
+  std::thread interrupter([&] {
+    helper->awaitNote("request ask");
+    wakeup->interrupt();
+  });
+  EXPECT_EQ(running.request("ask", nullptr, soon()).kind, Reply::Kind::kInterrupted);
+  interrupter.join();
+  wakeup->acknowledge();
+  EXPECT_EQ(running.request("ask", nullptr, soon()).kind, Reply::Kind::kOk);
+}
+
+TEST_F(SessionTest, AHelperThatCannotBeStartedIsSaidWithItsPathAndLeavesNothing) {
+  SessionOptions options;
+  options.helper = "/no/such/helper";
+  try {
+    const Session none(options);
+    FAIL();
+  } catch (const HelperNotStarted& problem) {
+    EXPECT_THAT(problem.what(), HasSubstr("/no/such/helper"));
+  }
+}
+
+// The pipes of a process behind its standard descriptors; of this one, those that are closed on exec.
+std::set<std::string> pipesOf(const std::string& process) {
+  std::set<std::string> pipes;
+  for (const auto& entry : std::filesystem::directory_iterator("/proc/" + process + "/fd")) {
+    const int number = std::stoi(entry.path().filename());
+    std::error_code gone;
+    const std::string target = std::filesystem::read_symlink(entry.path(), gone);
+    const bool ours = process == "self" && (fcntl(number, F_GETFD) & FD_CLOEXEC) == 0;
+    if (number > 2 && !ours && target.rfind("pipe:", 0) == 0) pipes.insert(target);
+  }
+  return pipes;
+}
+
+TEST_F(SessionTest, TheHelperInheritsNoDescriptorOfOurs) {
+  if (access("/proc/self/fd", R_OK) != 0) GTEST_SKIP() << "no list of descriptors";
+  Session& running = start("{}");
+  SessionOptions options;
+  options.helper = fake::Helper::path();
+  options.environment = helper->environment();
+  const Session second(options);  // made while the first one's pipes are open
+  helper->process(1);
+  const auto ours = pipesOf("self");
+  EXPECT_GE(ours.size(), 4U);
+  for (const pid_t process : {running.processId(), second.processId()}) {
+    for (const std::string& pipe : pipesOf(std::to_string(process))) EXPECT_FALSE(ours.count(pipe)) << pipe;
+  }
+}
+
+}  // namespace
