@@ -76,9 +76,7 @@ void KtRCMessageAccumulator::formMessagesWithData(const platform::Data& chunk) {
   Pass pass{in, total, 0};
   try {
     while (pass.position < pass.total && step(pass)) {
-      if (_currentMessageStage != kQueue) continue;
-      addMessageToQueue(_currentMessage);
-      startNextMessage();
+      if (_currentMessageStage == kQueue) addMessageToQueue();
     }
   } catch (const platform::Exception&) {
     // The bytes ran out, or the queue was not to be had: the next chunk goes on from the same step.
@@ -174,7 +172,7 @@ void KtRCMessageAccumulator::startNextMessage() {
   _bytesNeeded = 0;
 }
 
-void KtRCMessageAccumulator::addMessageToQueue(std::unique_ptr<CRCMessage>& message) {
+void KtRCMessageAccumulator::addMessageToQueue() {
   std::unique_lock guard(_messageQueueLock, kQueueLockWait);
   if (!guard) {
     platform::AssertionHandler::current().handleFailureInMethod(
@@ -182,8 +180,9 @@ void KtRCMessageAccumulator::addMessageToQueue(std::unique_ptr<CRCMessage>& mess
         "KtRemoteCommunicationMac: addMessageToQueue: Message is being lost because we timed out waiting for the queue "
         "lock!");
   }
-  _waitingMessages.push_back(std::move(message));
+  _waitingMessages.push_back(std::move(_currentMessage));
   guard.unlock();
+  startNextMessage();
   platform::NotificationCenter::defaultCenter().post({kMessageIsAvailable, this, nullptr});
 }
 

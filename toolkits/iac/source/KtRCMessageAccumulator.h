@@ -80,7 +80,7 @@ class KtRCMessageAccumulator {
   bool readId(Pass& pass);
   void readElement(Pass& pass, std::unique_ptr<KtLuaTE>& element);
   void dropFrame(Pass& pass, const char* reason);
-  void addMessageToQueue(std::unique_ptr<CRCMessage>& message);
+  void addMessageToQueue();
   void startNextMessage();
   void startReadThread();
 
