@@ -98,15 +98,37 @@ TEST_F(Process, LosesNothingOfEitherThreadWhileTheHostDoesNotRead) {
   for (int i = 1; i <= kPictures; ++i) EXPECT_EQ(helper.await("fileDownloadComplete").number("capture_id"), i);
 }
 
-TEST_F(Process, EndsOnASignalEvenWhileItsHostDoesNotRead) {
-  startWithCamera();
-  helper.narrowOutput();
-  std::string requests;
-  for (std::int32_t id = 10; id < 210; ++id) requests += request("connectDevice", id, 0x0109);
-  helper.send(requests);
-  awaitCondition("full pipe", [&] { return helper.unread() > kNearlyFull; });
+// A helper whose main thread waits for a host that does not read.
+class HeldUp : public Process {
+ protected:
+  HeldUp() {
+    startWithCamera();
+    helper.narrowOutput();
+    std::string requests;
+    for (std::int32_t id = 10; id < 210; ++id) requests += request("connectDevice", id, 0x0109);
+    helper.send(requests);
+    awaitCondition("full pipe", [&] { return helper.unread() > kNearlyFull; });
+  }
+};
+
+TEST_F(HeldUp, EndsOnASignal) {
   kill(helper.pid(), SIGTERM);
   EXPECT_EQ(helper.wait(Helper::Reading::no), 0);
+}
+
+TEST_F(HeldUp, EndsWithItsInput) {
+  helper.closeInput();
+  EXPECT_EQ(helper.wait(Helper::Reading::no), 0);
+}
+
+TEST_F(Process, TakesAFileThatIsNotWholeAlongWhenItEnds) {
+  startWithCamera(R"({"transfer": {"deliveryBytes": 1000, "bytesPerSecond": 1000}})");
+  drop(studio() / "1.jpg", pattern(1'000'000, 1));
+  helper.await("objectWasAdded");
+  EXPECT_TRUE(fs::exists(helper.temporary() / "Capture0001.jpg"));
+  helper.closeInput();
+  EXPECT_EQ(helper.wait(), 0);
+  EXPECT_TRUE(fs::is_empty(helper.temporary()));
 }
 
 }  // namespace

@@ -9,6 +9,7 @@
 namespace {
 
 using namespace std::chrono_literals;
+using virtualcamera::Level;
 using virtualcamera::Picture;
 
 // A download thread of the test's own.
@@ -135,6 +136,19 @@ TEST_F(ServiceTest, ACameraThatGoesWithItemsQueuedAndOneInTransferLeavesNothingB
   model.camera(2)->shoot(Picture::jpeg(bytes(7)));
   const Message complete = idleUntil("fileDownloadComplete");
   EXPECT_EQ(complete.numbers.at("capture_id"), recorder.await("objectWasAdded", 2).numbers.at("capture_id"));
+}
+
+TEST_F(ServiceTest, ATransferThatNeverCompletesIsGivenUpWithItsCamera) {
+  auto& camera = model.addCamera(1, "One");
+  model.faults().add({.level = Level::Data, .command = kNkMAIDCommand_CapStart, .noCompletion = true});
+  model.faults().add({.level = Level::Data, .command = kNkMAIDCommand_Async, .answer = 0, .doAnyway = true});
+  start();
+  camera.shoot(Picture::jpeg(bytes(100)));
+  idleUntil("objectWasAdded");
+  model.removeCamera(1);
+  idleUntil("deviceRemoved");
+  idle();
+  EXPECT_EQ(model.openObjects(), 1U);
 }
 
 TEST_F(ServiceTest, DeliveriesOnTheMainThreadAreHandledThere) {
