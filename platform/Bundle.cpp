@@ -10,9 +10,7 @@ namespace {
 
 const std::string kPlatformFolder = TETHER_BUNDLE_PLATFORM;
 
-}  // namespace
-
-std::string Bundle::mainBundlePath() {
+std::string findMainBundlePath() {
   const std::string executable = executablePath();
   const std::string_view folder = deletingLastPathComponent(executable);
   const std::string_view contents = deletingLastPathComponent(folder);
@@ -20,6 +18,14 @@ std::string Bundle::mainBundlePath() {
     return std::string(deletingLastPathComponent(contents));
   }
   return std::string(folder);
+}
+
+}  // namespace
+
+// Found once: it stays where it is, and finding it takes a system call for every folder above it.
+std::string Bundle::mainBundlePath() {
+  static const auto* const path = new std::string(findMainBundlePath());
+  return *path;
 }
 
 std::unique_ptr<Bundle> Bundle::create(const std::string& path) {
