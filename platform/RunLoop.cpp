@@ -25,11 +25,14 @@ struct RunLoop::Waiter {
   bool ran = false;
   std::exception_ptr thrown;
 
+  // Whoever calls this keeps the waiter; so the waiting thread may be woken outside the lock, which it wants at once.
   void finish(bool hasRun, std::exception_ptr exception) {
-    std::lock_guard guard(lock);
-    done = true;
-    ran = hasRun;
-    thrown = std::move(exception);
+    {
+      std::lock_guard guard(lock);
+      done = true;
+      ran = hasRun;
+      thrown = std::move(exception);
+    }
     changed.notify_all();
   }
 };
@@ -131,12 +134,14 @@ bool RunLoop::enqueue(Call call, std::shared_ptr<Waiter> waiter) {
 }
 
 void RunLoop::wakeUp() {
-  std::lock_guard guard(_lock);
-  if (_wakeUpSent) return;
+  {
+    std::lock_guard guard(_lock);
+    if (std::exchange(_wakeUpSent, true)) return;
+  }
+  // Outside the lock, which the loop wants as soon as it wakes.
   const char byte = 0;
   while (write(_wakeWrite, &byte, 1) < 0 && errno == EINTR) {
   }
-  _wakeUpSent = true;
 }
 
 void RunLoop::end() {
@@ -255,8 +260,8 @@ void RunLoop::waitForWork(Clock::time_point until) {
   }
   if (polled[0].revents != 0) {
     std::lock_guard guard(_lock);
-    std::array<char, 16> drained{};
-    while (read(_wakeRead, drained.data(), drained.size()) > 0) {
+    char byte = 0;  // there is never more than one
+    while (read(_wakeRead, &byte, 1) < 0 && errno == EINTR) {
     }
     _wakeUpSent = false;
   }
