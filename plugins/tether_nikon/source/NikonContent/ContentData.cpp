@@ -196,15 +196,17 @@ void CContentData::store(const tagNkMAIDFileInfo& info, const void* data) {
 void CContentData::finishFile() {
   const std::size_t size = static_cast<std::uint32_t>(_dataSize);
   const std::size_t written = std::fwrite(_buffer.get(), 1, size, _file.get());
+  int error = errno;
   const bool closed = std::fclose(_file.release()) == 0;
-  _buffer.reset();
+  if (written == size) error = errno;
   {
     const std::lock_guard guard(unfinishedFile().lock);
     _finished = written == size && closed && !unfinishedFile().processEnds;
     unfinishedFile().path.clear();
   }
   if (_finished) return;
-  platform::log("Writing %s failed: %s", _path.c_str(), std::strerror(errno));
+  _buffer.reset();
+  platform::log("Writing %s failed: %s", _path.c_str(), std::strerror(error));
   platform::FileManager::remove(_path);
   _abandoned = true;
 }
@@ -224,6 +226,7 @@ void CContentData::completionCallback_thread(std::int32_t command, std::int32_t 
     }
   }
   if (finished) NikonTetherService::getSingleton()->fileDownloadComplete(_captureId, _path);
+  _buffer.reset();  // not before: giving a large picture's memory back takes a while
   closeNikonObject();
   if (auto* const container = dynamic_cast<CContentContainer*>(parent())) container->contentFinishedDownloading(this);
 }
