@@ -8,6 +8,7 @@
 #include <limits>
 #include <memory>
 #include <new>
+#include <typeinfo>
 #include <utility>
 
 #include "KtLuaTableMarshalling.h"
@@ -23,14 +24,22 @@ constexpr std::int64_t kSmallestEntry = 2 * kSmallestElement;
 
 // How many bytes the stream still has, or a negative number where its buffer does not tell.
 std::int64_t available(std::istream& in) {
-  const auto* buffer = dynamic_cast<const KtNSDataReadStreamBuf*>(in.rdbuf());
-  return buffer == nullptr ? -1 : buffer->available();
+  const std::streambuf* const buffer = in.rdbuf();
+  // The usual type is told by one comparison; the others take a search.
+  if (buffer != nullptr && typeid(*buffer) == typeid(KtNSDataReadStreamBuf)) {
+    return static_cast<const KtNSDataReadStreamBuf*>(buffer)->available();
+  }
+  const auto* const derived = dynamic_cast<const KtNSDataReadStreamBuf*>(buffer);
+  return derived == nullptr ? -1 : derived->available();
 }
 
 // Every byte of an element passes through here. A short read is a stream error that knows what was missing.
 void readBytes(std::istream& in, void* destination, std::int64_t count) {
-  in.read(static_cast<char*>(destination), count);
-  if (in.eof() || in.fail() || in.bad()) throw KtStreamError(std::max<std::int64_t>(count - in.gcount(), 1));
+  // Past the stream to its buffer: what the stream adds to a read costs more than most fields.
+  const std::int64_t got = in.good() ? in.rdbuf()->sgetn(static_cast<char*>(destination), count) : 0;
+  if (got == count) return;
+  in.setstate(std::ios_base::eofbit | std::ios_base::failbit);
+  throw KtStreamError(std::max<std::int64_t>(count - got, 1));
 }
 
 template <typename Field>
@@ -40,11 +49,18 @@ Field readField(std::istream& in) {
   return field;
 }
 
-template <typename Field>
-void writeField(std::ostream& out, Field field) {
-  char bytes[sizeof field];
-  std::memcpy(bytes, &field, sizeof field);
-  out.write(bytes, sizeof bytes);
+void writeBytes(std::ostream& out, const void* bytes, std::streamsize count) {
+  // Past the stream to its buffer, as with reading.
+  if (out.rdbuf()->sputn(static_cast<const char*>(bytes), count) != count) out.setstate(std::ios_base::badbit);
+}
+
+// Fields that follow each other, in one piece.
+template <typename... Fields>
+void writeFields(std::ostream& out, Fields... fields) {
+  char bytes[(sizeof fields + ...)];
+  char* end = bytes;
+  ((std::memcpy(end, &fields, sizeof fields), end += sizeof fields), ...);
+  writeBytes(out, bytes, sizeof bytes);
 }
 
 // Before a block of that length is allocated: it must be possible at all, and all of it must be there.
@@ -169,30 +185,24 @@ KtLuaTETable::KtLuaTETable(std::istream& in) : KtLuaTE(kKtLuaTypeTable) {
 
 // Writing.
 
-void KtLuaTENil::writeToStream(std::ostream& out) const { writeField(out, getType()); }
+void KtLuaTENil::writeToStream(std::ostream& out) const { writeFields(out, getType()); }
 
-void KtLuaTENumber::writeToStream(std::ostream& out) const {
-  writeField(out, getType());
-  writeField(out, value);
-}
+void KtLuaTENumber::writeToStream(std::ostream& out) const { writeFields(out, getType(), value); }
 
 void KtLuaTEString::writeToStream(std::ostream& out) const {
   const std::size_t count = std::min(value.find('\0'), value.size());
-  writeField(out, getType());
-  writeField(out, static_cast<std::int32_t>(count + 1));
+  writeFields(out, getType(), static_cast<std::int32_t>(count + 1));
   // c_str() ends in a NUL of its own, so the one behind the text is there either way.
-  out.write(value.c_str(), static_cast<std::streamsize>(count + 1));
+  writeBytes(out, value.c_str(), static_cast<std::streamsize>(count + 1));
 }
 
 void KtLuaTEData::writeToStream(std::ostream& out) const {
-  writeField(out, getType());
-  writeField(out, length);
-  out.write(static_cast<const char*>(bytes), length);
+  writeFields(out, getType(), length);
+  writeBytes(out, bytes, length);
 }
 
 void KtLuaTETable::writeToStream(std::ostream& out) const {
-  writeField(out, getType());
-  writeField(out, static_cast<std::int32_t>(entries.size()));
+  writeFields(out, getType(), static_cast<std::int32_t>(entries.size()));
   for (const auto& [key, value] : entries) {
     key->writeToStream(out);
     value->writeToStream(out);
