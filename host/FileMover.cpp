@@ -4,8 +4,10 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
+#include <initializer_list>
 #include <string_view>
 #include <vector>
 
@@ -19,12 +21,14 @@ namespace {
 constexpr int kMostNumbers = 100'000;
 constexpr std::size_t kCopyChunk = std::size_t{1} << 20;
 
-bool cannotRenameExclusively(int error) { return error == EINVAL || error == ENOSYS || error == ENOTSUP; }
-
-bool cannotLink(int error) {
-  // Too many links of one file among them.
-  return error == EPERM || error == ENOSYS || error == ENOTSUP || error == EOPNOTSUPP || error == EMLINK;
+// Two of these are one number on some systems.
+bool isOneOf(int error, std::initializer_list<int> errors) {
+  return std::find(errors.begin(), errors.end(), error) != errors.end();
 }
+
+bool cannotRenameExclusively(int error) { return isOneOf(error, {EINVAL, ENOSYS, ENOTSUP, EOPNOTSUPP}); }
+
+bool cannotLink(int error) { return isOneOf(error, {EPERM, ENOSYS, ENOTSUP, EOPNOTSUPP, EMLINK}); }
 
 // A name to put into a folder: the last component, and never one that leads elsewhere.
 std::string bareName(const std::string& name) {

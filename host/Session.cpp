@@ -54,7 +54,7 @@ class NoPipeSignal {
 
 }  // namespace
 
-Session::Session(Options options)
+Session::Session(const Options& options)
     : _silence(options.silence),
       _wakeup(options.wakeup ? options.wakeup : std::make_shared<Wakeup>()),
       _heard(Clock::now()) {

@@ -52,7 +52,7 @@ class Session {
   using Options = SessionOptions;
 
   // Starts the helper with a private temporary directory. Throws HelperNotStarted.
-  explicit Session(Options options);
+  explicit Session(const Options& options);
   Session(const Session&) = delete;
   Session& operator=(const Session&) = delete;
   // As end() with a short grace. No process is left, and no directory unless files are in it.

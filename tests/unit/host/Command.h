@@ -82,6 +82,7 @@ class Command {
  private:
   static std::vector<char*> pointers(std::vector<std::string>& texts) {
     std::vector<char*> all;
+    all.reserve(texts.size() + 1);
     for (auto& text : texts) all.push_back(text.data());
     all.push_back(nullptr);
     return all;

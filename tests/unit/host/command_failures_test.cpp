@@ -9,7 +9,6 @@ using fake::Command;
 using fake::Folder;
 using fake::Helper;
 using testing::AllOf;
-using testing::Each;
 using testing::ElementsAre;
 using testing::HasSubstr;
 using testing::IsEmpty;

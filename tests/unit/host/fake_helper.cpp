@@ -69,10 +69,10 @@ class FakeHelper {
   int run() {
     auto& center = platform::NotificationCenter::defaultCenter();
     KtRCMessageAccumulator reader(platform::FileHandle::standardInput());
-    const auto available = center.addObserver(std::string(kMessageIsAvailable), &reader, [&](const auto&) {
+    _available = center.addObserver(std::string(kMessageIsAvailable), &reader, [&](const auto&) {
       while (const auto message = reader.getNextMessage()) dispatch(*message);
     });
-    const auto finished = center.addObserver(std::string(kReadHandleIsFinished), &reader, [&](const auto&) {
+    _finished = center.addObserver(std::string(kReadHandleIsFinished), &reader, [&](const auto&) {
       note("end");
       if (!_script.value("ignoresEndOfInput", false)) _exit(0);
     });
@@ -155,6 +155,8 @@ class FakeHelper {
   json _script;
   std::map<std::string, int> _count;
   std::map<std::string, std::int32_t> _seen;
+  platform::Observer _available;
+  platform::Observer _finished;
   bool _reads = true;
 };
 

@@ -17,8 +17,6 @@ using fake::isGone;
 using fake::soon;
 using testing::ElementsAre;
 using testing::HasSubstr;
-using testing::IsEmpty;
-using testing::StartsWith;
 
 class SessionTest : public testing::Test {
  protected:
