@@ -1,0 +1,55 @@
+// The helper as a process of its own, and what the system tells of it.
+#pragma once
+
+#include <sys/types.h>
+
+#include <memory>
+#include <string>
+#include <vector>
+
+// A folder of its own under the temporary directory, removed with everything in it.
+class TemporaryFolder {
+ public:
+  TemporaryFolder();
+  TemporaryFolder(const TemporaryFolder&) = delete;
+  TemporaryFolder& operator=(const TemporaryFolder&) = delete;
+  ~TemporaryFolder();
+  const std::string& path() const { return _path; }
+
+ private:
+  std::string _path;
+};
+
+// Starts a program with descriptors for its input and output; a negative one is the null device, which its standard
+// error is always. The variables come before those of this process. Throws std::runtime_error when it cannot be.
+pid_t start(const std::string& program, const std::vector<std::string>& variables, int input = -1, int output = -1);
+void waitFor(pid_t process);
+
+// How long a thread has stood ready while others had the processors, in seconds.
+double processorWaitOf(const std::string& task);
+
+class HelperProcess {
+ public:
+  HelperProcess(const std::string& program, const std::vector<std::string>& variables);
+  HelperProcess(const HelperProcess&) = delete;
+  HelperProcess& operator=(const HelperProcess&) = delete;
+  // Ends its input and waits for it.
+  ~HelperProcess();
+
+  // Reads frames up to the next one of that name. Throws std::runtime_error when the helper ends before.
+  void await(const std::string& name);
+
+  // Processor time of all its threads, in seconds.
+  double processorTime() const;
+  // How long its busiest thread has stood ready while others had the processors, in seconds.
+  double processorWait() const;
+  // The most memory that it has had at a time, in bytes.
+  double peakMemory() const;
+
+ private:
+  std::string nextName();
+
+  pid_t _process = -1;
+  int _input = -1;
+  int _output = -1;
+};
