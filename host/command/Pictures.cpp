@@ -87,7 +87,11 @@ void Pictures::completed(const FileDownloadComplete& complete, const std::option
     picture = std::move(found->second);
     _underWay.erase(found);
   } else {
-    picture = {{complete.capture_id, false, complete.file_path, 0}, camera, nullptr, takeShutterTime(), _lastProgress};
+    picture.object.capture_id = complete.capture_id;
+    picture.object.file_name = complete.file_path;
+    picture.camera = camera;
+    picture.since = takeShutterTime();
+    picture.announced = _lastProgress;
   }
   const bool first = picture.pair && !picture.pair->base;
   const MovedFile moved = _mover.move(complete.file_path, picture.object.file_name, first,
