@@ -4,12 +4,14 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <chrono>
 #include <cstring>
 #include <mutex>
 
 #include "ContentContainer.h"
 #include "DebugTrace.h"
 #include "FileManager.h"
+#include "Locks.h"
 #include "Log.h"
 #include "NameTables.h"
 #include "NikonTetherService.h"
@@ -18,8 +20,11 @@
 
 namespace {
 
+using namespace std::chrono_literals;
+
 // How often a name that was taken between the search for it and the creation of the file is searched anew.
 constexpr int kMostNameTries = 1000;
+constexpr auto kFileLockWait = 200ms;
 
 // Deliveries share the map, the number and the service's count. Not held while calling into the SDK.
 std::mutex& deliveryLock() {
@@ -29,12 +34,13 @@ std::mutex& deliveryLock() {
 
 // The file that is being received. The process may end at any moment, and what is not whole then must not stay.
 struct UnfinishedFile {
-  std::mutex lock;
+  platform::TimedLock lock;
   std::string path;
   bool processEnds = false;
   const platform::Observer observer = platform::NotificationCenter::defaultCenter().addObserver(
       std::string(platform::kApplicationWillTerminateNotification), nullptr, [this](const auto&) {
-        const std::lock_guard guard(lock);
+        const std::unique_lock guard(lock, kFileLockWait);
+        if (!guard) return;  // a file system that hangs must not keep the process
         processEnds = true;
         if (!path.empty()) platform::FileManager::remove(path);
       });
