@@ -50,7 +50,7 @@ class CContentData : public CNikonThreadedObject {
 
   static std::int32_t _fileNumber;
 
-  CContentContainer* _container;
+  [[maybe_unused]] CContentContainer* _container;
   std::int32_t _dataSize = 0;
   bool _rawPlusJpeg = false;
   std::unique_ptr<std::FILE, FileCloser> _file;  // null before the first delivery and after the last
