@@ -181,6 +181,16 @@ TEST_F(FrameReader, AReaderThatWaitsInsideAFrameDoesNotDecodeItAgainForEveryByte
   EXPECT_EQ(takeIds(), (std::vector<std::int32_t>{1}));
 }
 
+TEST_F(FrameReader, ADamagedCountDoesNotHoldBackTheFramesBehindIt) {
+  // The table promises eight million entries, but what follows it is no key.
+  const std::string damaged = frame(1, kName + raw(kKtLuaTypeTable) + raw(std::int32_t{8000000}));
+  const std::string bytes = damaged + kHeartbeat + frame(2, kName + kNil);
+  for (const std::size_t chunk : {std::size_t{1}, std::size_t{13}, damaged.size(), bytes.size()}) {
+    feedInChunksOf(chunk, bytes);
+    EXPECT_EQ(takeIds(), (std::vector<std::int32_t>{0, 2})) << chunk;
+  }
+}
+
 TEST_F(FrameReader, TheEndOfTheInputIsToldOnceAndQueuedMessagesStay) {
   feed(kHeartbeat);
   writing.reset();

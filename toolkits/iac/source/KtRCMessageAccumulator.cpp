@@ -146,8 +146,11 @@ void KtRCMessageAccumulator::readElement(Pass& pass, std::unique_ptr<KtLuaTE>& e
     pass.position = end;
     ++_currentMessageStage;
   } catch (const KtStreamError& error) {
-    _bytesNeeded = pass.total - pass.position + error.missing();
-    if (_frameConsumed + _bytesNeeded <= kLargestRest) throw;
+    const std::int64_t there = pass.total - pass.position;
+    // Not for all that is missing: it is a length's word, and damage behind it shows with fewer bytes. With twice as
+    // many as before, all decoding together stays within a multiple of the last.
+    _bytesNeeded = there + std::min(error.missing(), there);
+    if (_frameConsumed + there + error.missing() <= kLargestRest) throw;
     dropFrame(pass, "runs past 64 MiB");
   } catch (const KtMalformedElement& error) {
     dropFrame(pass, error.reason().c_str());

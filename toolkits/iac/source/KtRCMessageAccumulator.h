@@ -94,7 +94,7 @@ class KtRCMessageAccumulator {
   std::int32_t _currentMessageStage = kLength;
 
   std::int64_t _frameConsumed = 0;  // bytes of the current frame behind its length field that are decoded
-  std::int64_t _bytesNeeded = 0;    // what the current element takes at the least
+  std::int64_t _bytesNeeded = 0;    // before the current element is decoded again
   std::int64_t _bytesToSkip = 0;    // of a dropped frame, still to arrive
   platform::Observer _readObserver;
   std::shared_ptr<platform::Thread> _readThread;
