@@ -1,0 +1,184 @@
+// The camera side against a module whose answers are any bytes: the registry's road from the scan to a picture, and
+// every reader of every value. Nothing crashes or waits for ever, everything opened is closed, and a picture that is
+// announced as complete is there in the size that was announced.
+#include <sys/resource.h>
+
+#include <csignal>
+#include <cstdlib>
+#include <filesystem>
+#include <map>
+#include <memory>
+#include <mutex>
+#include <string>
+
+#include "Check.h"
+#include "ContentContainer.h"
+#include "ContentData.h"
+#include "FuzzedModule.h"
+#include "HostMessages.h"
+#include "KtNSDataStreamBuf.h"
+#include "Log.h"
+#include "NikonModule.h"
+#include "NikonTetherService.h"
+
+using fuzz::check;
+using fuzz::FuzzedModule;
+using fuzz::Input;
+namespace fs = std::filesystem;
+
+namespace {
+
+constexpr std::int32_t kModuleId = 0x100;
+constexpr std::size_t kMostCameras = 3;
+constexpr std::size_t kMostItems = 2;
+// A module may announce 4 GiB. So much is not written; more of it is a disk that is full.
+constexpr rlim_t kLargestFile = 1 << 18;
+
+std::map<double, double> announcedSizes;  // by capture id
+
+double numberIn(const KtLuaTETable& table, const char* key) {
+  KtLuaTE* const value = table.elementForKey(key);
+  check(value != nullptr && value->getType() == kKtLuaTypeNumber, "a message has its numbers");
+  return static_cast<double>(*value);
+}
+
+// Everything that a run needs of the process: no log, a service without modules, an empty folder for the pictures.
+const fs::path& pictureFolder() {
+  static const auto* const folder = [] {
+    platform::setLogSink([](const std::string&) {});
+    std::signal(SIGXFSZ, SIG_IGN);
+    std::string path = (fs::temp_directory_path() / "tether-fuzz-XXXXXX").string();
+    check(mkdtemp(path.data()) != nullptr, "there is a folder for the pictures");
+    setenv("TMPDIR", path.c_str(), 1);
+    NikonTetherService::getSingleton();
+    return new fs::path(path);
+  }();
+  static const struct Remover {
+    ~Remover() {
+      std::error_code ignored;
+      fs::remove_all(*folder, ignored);
+    }
+  } remover;
+  return *folder;
+}
+
+class FileSizeLimit {
+ public:
+  FileSizeLimit() {
+    getrlimit(RLIMIT_FSIZE, &_before);
+    const rlimit limit{kLargestFile, _before.rlim_max};
+    setrlimit(RLIMIT_FSIZE, &limit);
+  }
+  FileSizeLimit(const FileSizeLimit&) = delete;
+  FileSizeLimit& operator=(const FileSizeLimit&) = delete;
+  ~FileSizeLimit() { setrlimit(RLIMIT_FSIZE, &_before); }
+
+ private:
+  rlimit _before{};
+};
+
+void readEverything(CNikonObject& object) {
+  object.debugDumpCapabilities();
+  for (const auto& [capability, type] : fuzz::usualCapabilities) {
+    const auto id = static_cast<std::int32_t>(capability);
+    std::int32_t number = 0;
+    bool truth = false;
+    std::string text;
+    object.getCapabilityAsTE(id);
+    object.getIntCapability(id, number);
+    object.getEnumIntCapability(id, number);
+    object.getBoolCapability(id, truth);
+    object.getStringCapability(id, text);
+    check(text.size() <= kNkMAIDStringSize, "a string ends with its buffer");
+    object.getEnumStringCapability(id, text);
+  }
+}
+
+void takePictures(CNikonObject& camera) {
+  std::vector<std::int32_t> ids;
+  camera.listChildren(ids);
+  ids.resize(std::min(ids.size(), kMostItems));
+  for (const std::int32_t id : ids) {
+    try {
+      auto item = std::make_unique<CContentContainer>(&camera, id, id & 3);
+      CContentContainer& taken = *item.release();  // the camera's
+      const std::lock_guard access(gNikonAsyncLock);
+      taken.setInUse(true);
+      taken.beginDownload();
+      taken.setInUse(false);
+    } catch (std::int32_t) {
+      // It could not be opened.
+    }
+  }
+}
+
+void useCamera(CNikonModule& module, std::int32_t id) {
+  CNikonObject* camera = module.cameraById(id);
+  if (camera != nullptr) {
+    if (module.getConnectedCameraId() == 0) module.connectCamera(1, id);
+    module.getCameraSettings(2, id);
+    module.doCapture();
+  } else {
+    camera = module.openChild(id, "camera");
+  }
+  if (camera == nullptr) return;
+  readEverything(*camera);
+  takePictures(*camera);
+  camera->capStart(kNkMAIDCapability_Capture, camera, nullptr);
+}
+
+void useModule() {
+  CNikonModule module(FuzzedModule::entryPoint, "Fuzzed", kModuleId);
+  readEverything(module);
+  module.enumChildren();
+  module.doInitialCameraScan();
+  std::vector<std::int32_t> ids;
+  module.listChildren(ids);
+  ids.resize(std::min(ids.size(), kMostCameras));
+  for (const std::int32_t id : ids) useCamera(module, id);
+  module.async();
+  module.scanAndInformHostOfCameraChanges();
+  for (const CCamera* const camera : module.getCamerasToDelete()) delete camera;
+  module.getCamerasToDelete().clear();
+}
+
+}  // namespace
+
+void SendMessageToClient(long /*id*/, const char* name, KtLuaTETable* data) {
+  if (data == nullptr) return;
+  KtNSDataWriteStreamBuf written;
+  std::ostream out(&written);
+  data->writeToStream(out);
+  KtNSDataReadStreamBuf buffer(written.getNSData());
+  std::istream in(&buffer);
+  const std::unique_ptr<KtLuaTE> read(KtLuaTE::createFromStream(in));
+  check(read != nullptr && buffer.available() == 0, "the host can read every message");
+
+  if (name == std::string("objectWasAdded"))
+    announcedSizes[numberIn(*data, "capture_id")] = numberIn(*data, "file_size");
+  if (name != std::string("fileDownloadComplete")) return;
+  const auto announced = announcedSizes.find(numberIn(*data, "capture_id"));
+  check(announced != announcedSizes.end(), "what is complete was announced");
+  const auto size = static_cast<std::uint32_t>(static_cast<std::int64_t>(announced->second));
+  KtLuaTE* const path = data->elementForKey("file_path");
+  check(path != nullptr, "what is complete has a path");
+  check(fs::file_size(static_cast<std::string>(*path)) == size, "what is complete has its size");
+}
+
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t* bytes, size_t count) {
+  const fs::path& folder = pictureFolder();
+  Input input(bytes, count);
+  {
+    const FileSizeLimit limit;
+    FuzzedModule module(input);
+    try {
+      useModule();
+    } catch (std::int32_t) {
+      // It could not be opened.
+    }
+  }
+  announcedSizes.clear();
+  gDownloadIdToNameMap.clear();
+  for (const auto& file : fs::directory_iterator(folder)) fs::remove(file.path());
+  return 0;
+}
