@@ -1,6 +1,7 @@
 #include "TetherTask.h"
 
 #include <array>
+#include <cerrno>
 #include <chrono>
 #include <cstring>
 #include <ostream>
@@ -156,7 +157,7 @@ void TetherTask::sendMessage(const KtLuaTEString& name, std::int32_t id, const K
   frame.append(dataBytes->bytes(), dataBytes->length());
   if (_hostIsGone) return;
   const int error = _outputFileHandle->write(frame.bytes(), frame.length());
-  if (error != 0 && !_hostIsGone.exchange(true)) {
+  if (error != 0 && error != ECANCELED && !_hostIsGone.exchange(true)) {
     platform::log("Writing to the host failed, no more is written: %s", std::strerror(error));
   }
 }

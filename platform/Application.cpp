@@ -95,7 +95,7 @@ Application& Application::shared() {
 
 void Application::terminate() {
   NotificationCenter::defaultCenter().post({kApplicationWillTerminateNotification, this, nullptr});
-  const std::unique_lock lastWrite(FileHandle::standardOutput()->writeLock(), kLastWriteWait);
+  FileHandle::standardOutput()->finishWriting(kLastWriteWait);
 #if defined(__SANITIZE_ADDRESS__)
   __lsan_do_leak_check();
 #endif

@@ -57,8 +57,16 @@ void FileHandle::readNow() {
       {kFileHandleReadCompletionNotification, this, std::make_shared<const Data>(std::move(bytes))});
 }
 
+void FileHandle::finishWriting(Clock::duration wait) {
+  _writingIsOver = true;
+  const std::unique_lock guard(_writeLock, wait);
+}
+
 int FileHandle::write(const char* bytes, std::size_t count) {
+  // Looked at before the lock, which a thread that writes on and on would hardly let go of otherwise, and under it.
+  if (_writingIsOver) return ECANCELED;
   std::lock_guard guard(_writeLock);
+  if (_writingIsOver) return ECANCELED;
   while (count > 0) {
     const ssize_t written = ::write(_descriptor, bytes, std::min(count, kLargestWrite));
     if (written >= 0) {

@@ -1,6 +1,7 @@
 // One end of a pipe, or a file: whole writes, and background reads that report through a notification.
 #pragma once
 
+#include <atomic>
 #include <chrono>
 #include <memory>
 #include <mutex>
@@ -36,13 +37,14 @@ class FileHandle {
   // it takes. 0, or the error number of the write that failed: part of the bytes may then be out. Any thread.
   int write(const char* bytes, std::size_t count);
 
-  // Held while one write is in progress. Whoever has it knows the last write to be whole.
-  TimedLock& writeLock() { return _writeLock; }
+  // Lets no further write begin, they report ECANCELED, and waits so long at most for the one in progress to be whole.
+  void finishWriting(Clock::duration wait);
 
  private:
   void readNow();
 
   const int _descriptor;
+  std::atomic<bool> _writingIsOver{false};
   TimedLock _writeLock;
   DescriptorWatch _watch;
 };
