@@ -5,7 +5,6 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <cstdint>
@@ -83,14 +82,6 @@ void waitFor(pid_t process) {
   }
 }
 
-double processorWaitOf(const std::string& task) {
-  std::ifstream figures(task + "/schedstat");
-  double ran = 0;
-  double waited = 0;
-  figures >> ran >> waited;
-  return waited * 1e-9;
-}
-
 HelperProcess::HelperProcess(const std::string& program, const std::vector<std::string>& variables) {
   const auto toHelper = makePipe();
   const auto fromHelper = makePipe();
@@ -131,19 +122,11 @@ double HelperProcess::processorTime() const {
   return static_cast<double>(used.tv_sec) + static_cast<double>(used.tv_nsec) * 1e-9;
 }
 
-double HelperProcess::processorWait() const {
-  double longest = 0;
-  for (const auto& task : std::filesystem::directory_iterator("/proc/" + std::to_string(_process) + "/task")) {
-    longest = std::max(longest, processorWaitOf(task.path()));
-  }
-  return longest;
-}
-
-double HelperProcess::peakMemory() const {
+double HelperProcess::memoryFigure(const std::string& name) const {
   std::ifstream status("/proc/" + std::to_string(_process) + "/status");
   std::string line;
   while (std::getline(status, line)) {
-    if (line.rfind("VmHWM:", 0) == 0) return std::stod(line.substr(6)) * 1024;
+    if (line.rfind(name, 0) == 0) return std::stod(line.substr(name.size())) * 1024;
   }
   throw std::runtime_error("the helper's memory cannot be read");
 }

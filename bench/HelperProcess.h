@@ -25,9 +25,6 @@ class TemporaryFolder {
 pid_t start(const std::string& program, const std::vector<std::string>& variables, int input = -1, int output = -1);
 void waitFor(pid_t process);
 
-// How long a thread has stood ready while others had the processors, in seconds.
-double processorWaitOf(const std::string& task);
-
 class HelperProcess {
  public:
   HelperProcess(const std::string& program, const std::vector<std::string>& variables);
@@ -41,13 +38,13 @@ class HelperProcess {
 
   // Processor time of all its threads, in seconds.
   double processorTime() const;
-  // How long its busiest thread has stood ready while others had the processors, in seconds.
-  double processorWait() const;
-  // The most memory that it has had at a time, in bytes.
-  double peakMemory() const;
+  // Resident memory, now and the most that it has had at a time, in bytes.
+  double memory() const { return memoryFigure("VmRSS:"); }
+  double peakMemory() const { return memoryFigure("VmHWM:"); }
 
  private:
   std::string nextName();
+  double memoryFigure(const std::string& name) const;
 
   pid_t _process = -1;
   int _input = -1;

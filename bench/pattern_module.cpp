@@ -1,9 +1,14 @@
 // A camera module with pictures that are stored nowhere: TETHER_BENCH_PICTURES="COUNT BYTES" says how many its one
-// camera holds from the start, and how large each is.
+// camera holds from the start, and how large each is. Every byte that comes through the named pipe TETHER_BENCH_SHUTTER
+// is one more.
+#include <fcntl.h>
+#include <unistd.h>
+
 #include <cstdint>
 #include <cstdio>
 #include <cstdlib>
 #include <memory>
+#include <thread>
 #include <utility>
 #include <vector>
 
@@ -34,11 +39,18 @@ virtualcamera::Model* makeModel() {
   char* end = nullptr;
   const auto count = std::strtoul(pictures, &end, 10);
   const auto bytes = std::strtoul(end, nullptr, 10);
-  for (unsigned long number = 0; number < count; ++number) {
+  const auto shoot = [&camera, bytes] {
     virtualcamera::Picture picture;
     picture.source = std::make_shared<Blank>(bytes);
     camera.shoot(std::move(picture));
-  }
+  };
+  for (unsigned long number = 0; number < count; ++number) shoot();
+  const char* const shutter = std::getenv("TETHER_BENCH_SHUTTER");
+  const int pipe = shutter == nullptr ? -1 : open(shutter, O_RDONLY | O_CLOEXEC);
+  if (pipe < 0) return model;
+  std::thread([pipe, shoot] {
+    for (char press = 0; read(pipe, &press, 1) == 1;) shoot();
+  }).detach();
   return model;
 }
 

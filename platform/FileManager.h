@@ -1,6 +1,7 @@
 // Questions to the file system, and text operations on UTF-8 paths.
 #pragma once
 
+#include <cstdint>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -14,6 +15,9 @@ class FileManager {
   static bool isDirectory(const std::string& path);
   // Removes a file. False when it is still there or never was.
   static bool remove(const std::string& path);
+  // Keeps room on the disk for that many bytes of an open file, whose size stays. 0, or the error where there is not
+  // as much room; a file system that cannot keep any answers 0 too.
+  static int reserve(int file, std::uint64_t bytes);
   // Names in a directory without "." and "..", sorted; none when it cannot be read.
   static std::vector<std::string> contents(const std::string& directory);
 };

@@ -20,11 +20,6 @@ class TimedLock {
     _freed.wait(guard, [this] { return !_taken; });
     _taken = true;
   }
-  bool try_lock() {
-    std::lock_guard guard(_state);
-    if (_taken) return false;
-    return _taken = true;
-  }
   template <typename Duration>
   bool try_lock_for(Duration wait) {
     std::unique_lock guard(_state);

@@ -3,6 +3,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <array>
 #include <csignal>
 #include <cstdlib>
@@ -12,6 +13,7 @@
 #include "Bundle.h"
 #include "FileHandle.h"
 #include "FileManager.h"
+#include "MemoryBlock.h"
 #include "NotificationCenter.h"
 
 namespace {
@@ -20,6 +22,7 @@ using namespace std::chrono_literals;
 using platform::Clock;
 using platform::FileHandle;
 using platform::FileManager;
+using platform::MemoryBlock;
 using platform::RunLoop;
 
 struct Pipe {
@@ -112,6 +115,26 @@ TEST_F(InFolder, ADanglingLinkCountsAsSomethingThere) {
   EXPECT_TRUE(FileManager::remove(link));
   EXPECT_FALSE(FileManager::exists(link));
   EXPECT_FALSE(FileManager::remove(link));
+}
+
+TEST_F(InFolder, RoomIsKeptWithoutChangingTheSizeAndItsLackIsTold) {
+  const std::string path = folder + "/file";
+  const int file = open(path.c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0600);
+  EXPECT_EQ(FileManager::reserve(file, 1U << 20), 0);
+  EXPECT_NE(FileManager::reserve(file, std::uint64_t{1} << 60), 0);
+  EXPECT_EQ(std::filesystem::file_size(path), 0U);
+  close(file);
+}
+
+TEST(MemoryBlock, IsZeroAndMoves) {
+  for (const std::size_t size : {std::size_t{100}, std::size_t{5} << 20}) {
+    MemoryBlock block(size);
+    EXPECT_TRUE(std::all_of(block.data(), block.data() + size, [](char byte) { return byte == 0; }));
+    block.data()[size - 1] = 'x';
+    const MemoryBlock moved = std::move(block);
+    EXPECT_EQ(moved.data()[moved.size() - 1], 'x');
+  }
+  EXPECT_EQ(MemoryBlock(SIZE_MAX / 2).data(), nullptr);
 }
 
 TEST_F(InFolder, TheTemporaryDirectoryIsTheNamedOneWhereThereIsOne) {

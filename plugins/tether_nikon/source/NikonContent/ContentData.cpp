@@ -3,6 +3,7 @@
 #include <fcntl.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <chrono>
 #include <cstring>
@@ -25,11 +26,31 @@ using namespace std::chrono_literals;
 // How often a name that was taken between the search for it and the creation of the file is searched anew.
 constexpr int kMostNameTries = 1000;
 constexpr auto kFileLockWait = 200ms;
+// Long enough for the pauses in a series, short enough that memory is not held through a break.
+constexpr auto kBufferRest = 5s;
+// A smaller file is written before its blocks are chosen; to keep room for it costs more than it saves.
+constexpr std::size_t kLeastReserved = std::size_t{1} << 20;
 
 // Deliveries share the map, the number and the service's count. Not held while calling into the SDK.
 std::mutex& deliveryLock() {
   static auto* const lock = new std::mutex;
   return *lock;
+}
+
+// A picture's buffer, for the next one: new memory costs more than filling it. Under the lock of the deliveries.
+struct KeptBuffer {
+  platform::MemoryBlock block;
+  std::chrono::steady_clock::time_point since;
+
+  void keep(platform::MemoryBlock used) {
+    if (used.size() > block.size()) block = std::move(used);
+    since = std::chrono::steady_clock::now();
+  }
+};
+
+KeptBuffer& keptBuffer() {
+  static auto* const buffer = new KeptBuffer;
+  return *buffer;
 }
 
 // The file that is being received. The process may end at any moment, and what is not whole then must not stay.
@@ -98,6 +119,7 @@ CContentData::CContentData(CContentContainer* container, std::int32_t dataType, 
 
 CContentData::~CContentData() {
   closeGate();
+  const std::lock_guard guard(deliveryLock());
   giveFileUp();
 }
 
@@ -106,8 +128,10 @@ void CContentData::giveFileUp() {
   if (!_file) return;
   const std::lock_guard guard(unfinishedFile().lock);
   unfinishedFile().path.clear();
+  // The room that was kept for it would stay with the empty file.
+  if (ftruncate(fileno(_file.get()), 0) != 0) debugmsgstr("cannot shorten %s", _path.c_str());
   _file.reset();
-  _buffer.reset();
+  keptBuffer().keep(std::move(_buffer));
 }
 
 void CContentData::startDownload(const std::string& name) {
@@ -143,11 +167,7 @@ void CContentData::beginFile(const tagNkMAIDFileInfo& info) {
     _abandoned = true;
     return;
   }
-  // Zeroed, so that bytes that are never delivered are not what memory held before.
-  const std::size_t size = static_cast<std::uint32_t>(_dataSize);
-  _buffer.reset(static_cast<char*>(std::calloc(size > 0 ? size : 1, 1)));
-  if (!_buffer) {
-    platform::log("No memory for the %zu bytes of %s", size, _fileName.c_str());
+  if (!takeBuffer()) {
     giveFileUp();
     platform::FileManager::remove(_path);
     _abandoned = true;
@@ -194,14 +214,42 @@ bool CContentData::openFile() {
   return false;
 }
 
+// The buffer and the room on the disk: what is missing had better be known before the host is told of the picture.
+bool CContentData::takeBuffer() {
+  const std::size_t size = static_cast<std::uint32_t>(_dataSize);
+  const int error = size < kLeastReserved ? 0 : platform::FileManager::reserve(fileno(_file.get()), size);
+  if (error != 0) {
+    platform::log("No room for the %zu bytes of %s: %s", size, _fileName.c_str(), std::strerror(error));
+    return false;
+  }
+  _buffer = std::move(keptBuffer().block);
+  if (_buffer.size() < size) {
+    _buffer = {};  // before there is another one
+    _buffer = platform::MemoryBlock(size);
+  }
+  if (_buffer.size() >= size) return true;
+  platform::log("No memory for the %zu bytes of %s", size, _fileName.c_str());
+  return false;
+}
+
 void CContentData::store(const tagNkMAIDFileInfo& info, const void* data) {
   if (data == nullptr || endOf(info) > static_cast<std::uint32_t>(_dataSize)) return;
-  std::memcpy(_buffer.get() + info.ulStart, data, info.ulLength);
+  zeroUpTo(info.ulStart);
+  std::memcpy(_buffer.data() + info.ulStart, data, info.ulLength);
+  _known = std::max(_known, static_cast<std::size_t>(endOf(info)));
+}
+
+// What no delivery brought is zero, not what the picture before had there.
+void CContentData::zeroUpTo(std::size_t end) {
+  if (end <= _known) return;
+  std::memset(_buffer.data() + _known, 0, end - _known);
+  _known = end;
 }
 
 void CContentData::finishFile() {
   const std::size_t size = static_cast<std::uint32_t>(_dataSize);
-  const std::size_t written = std::fwrite(_buffer.get(), 1, size, _file.get());
+  zeroUpTo(size);
+  const std::size_t written = std::fwrite(_buffer.data(), 1, size, _file.get());
   int error = errno;
   const bool closed = std::fclose(_file.release()) == 0;
   if (written == size) error = errno;
@@ -210,11 +258,17 @@ void CContentData::finishFile() {
     _finished = written == size && closed && !unfinishedFile().processEnds;
     unfinishedFile().path.clear();
   }
+  keptBuffer().keep(std::move(_buffer));
   if (_finished) return;
-  _buffer.reset();
   platform::log("Writing %s failed: %s", _path.c_str(), std::strerror(error));
   platform::FileManager::remove(_path);
   _abandoned = true;
+}
+
+void CContentData::giveRestedBufferBack() {
+  platform::MemoryBlock rested;  // given back after the lock: it takes a while
+  const std::lock_guard guard(deliveryLock());
+  if (std::chrono::steady_clock::now() - keptBuffer().since >= kBufferRest) rested = std::move(keptBuffer().block);
 }
 
 // The end.
@@ -232,7 +286,6 @@ void CContentData::completionCallback_thread(std::int32_t command, std::int32_t 
     }
   }
   if (finished) NikonTetherService::getSingleton()->fileDownloadComplete(_captureId, _path);
-  _buffer.reset();  // not before: giving a large picture's memory back takes a while
   closeNikonObject();
   if (auto* const container = dynamic_cast<CContentContainer*>(parent())) container->contentFinishedDownloading(this);
 }

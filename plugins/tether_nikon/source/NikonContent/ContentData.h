@@ -4,12 +4,13 @@
 // SDK delivers them. One delivery of the process is handled at a time.
 #pragma once
 
+#include <cstdint>
 #include <cstdio>
-#include <cstdlib>
 #include <map>
 #include <memory>
 #include <string>
 
+#include "MemoryBlock.h"
 #include "NikonThreadedObject.h"
 
 class CContentContainer;
@@ -33,17 +34,19 @@ class CContentData : public CNikonThreadedObject {
   bool isRawPlusJPEG() const { return _rawPlusJpeg; }
   void setDownloadId(std::int32_t downloadId) { _downloadId = downloadId; }
 
+  // The buffer of a picture is kept for the next one. Gives it back when there has been none for a while. Any thread.
+  static void giveRestedBufferBack();
+
  private:
   struct FileCloser {
     void operator()(std::FILE* file) const { std::fclose(file); }
-  };
-  struct Freer {
-    void operator()(char* block) const { std::free(block); }
   };
 
   void beginFile(const tagNkMAIDFileInfo& info);
   void makeFileName(std::uint32_t fileDataType);
   bool openFile();
+  bool takeBuffer();
+  void zeroUpTo(std::size_t end);
   void store(const tagNkMAIDFileInfo& info, const void* data);
   void finishFile();
   void giveFileUp();
@@ -54,7 +57,8 @@ class CContentData : public CNikonThreadedObject {
   std::int32_t _dataSize = 0;
   bool _rawPlusJpeg = false;
   std::unique_ptr<std::FILE, FileCloser> _file;  // null before the first delivery and after the last
-  std::unique_ptr<char, Freer> _buffer;          // the whole file
+  platform::MemoryBlock _buffer;                 // the whole file, in its first _dataSize bytes
+  std::size_t _known = 0;                        // so many bytes of it are delivered ones, or zero
   bool _finished = false;                        // the file is written
   std::int32_t _captureId = 0;
   std::string _fileName;

@@ -4,6 +4,7 @@
 #include <utility>
 
 #include "ContentContainer.h"
+#include "ContentData.h"
 #include "NikonCamera.h"
 
 namespace {
@@ -61,6 +62,7 @@ void NikonDownloadThread::timerTask(platform::Timer& timer) {
     timer.invalidate();
   } else {
     processNextTask();
+    CContentData::giveRestedBufferBack();
   }
 }
 
