@@ -200,6 +200,29 @@ TEST_F(FrameReader, TheEndOfTheInputIsToldOnceAndQueuedMessagesStay) {
   EXPECT_EQ(takeIds().size(), 1U);
 }
 
+TEST_F(FrameReader, ReadsNoMoreThanItMayKeepUntilItsQueueIsEmptyAgain) {
+  // More than may wait, and more than the pipe holds beside it.
+  constexpr std::int32_t kCount = 3 * kMostWaitingMessages;
+  std::thread host([&] {
+    for (std::int32_t id = 0; id < kCount; ++id) {
+      const std::string bytes = frame(id, kName + kNil);
+      EXPECT_EQ(writing->write(bytes.data(), bytes.size()), 0);
+    }
+  });
+  std::vector<std::int32_t> ids;
+  while (ids.size() < kCount) {
+    const std::size_t before = available;
+    while (available - before < kMostWaitingMessages && ids.size() + available - before < kCount) {
+      RunLoop::current()->runOnce(Clock::now() + 5s);
+    }
+    for (int turn = 0; turn < 3; ++turn) RunLoop::current()->runOnce(Clock::now());
+    EXPECT_LT(available - before, kMostWaitingMessages + 64 * 1024 / frame(0, kName + kNil).size() + 2);
+    for (const std::int32_t id : takeIds()) ids.push_back(id);
+  }
+  host.join();
+  for (std::int32_t id = 0; id < kCount; ++id) ASSERT_EQ(ids[static_cast<std::size_t>(id)], id);
+}
+
 TEST_F(FrameReader, AMessageThatMissesTheQueueLockIsQueuedFirstInTheNextPass) {
   auto& lock = KtRCMessageAccumulatorTest::queueLock(*reader);
   std::promise<void> held;

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <chrono>
+#include <utility>
 
 #include "KtNSDataStreamBuf.h"
 #include "Log.h"
@@ -21,6 +22,7 @@ KtRCMessageAccumulator::KtRCMessageAccumulator(std::shared_ptr<platform::FileHan
       _accumulatedData(std::make_shared<platform::MutableData>()),
       _currentMessage(std::make_unique<CRCMessage>()) {
   if (!fromOrchard) {
+    _callersLoop = platform::RunLoop::current();
     observePipeForData();
     return;
   }
@@ -53,13 +55,25 @@ void KtRCMessageAccumulator::dataWasRead(const platform::Notification& notificat
     platform::NotificationCenter::defaultCenter().post({kReadHandleIsFinished, this, nullptr});
     return;
   }
+  const std::size_t chunk = notification.data->length();
   try {
     formMessagesWithData(*notification.data);
   } catch (...) {
-    _sourceFileHandle->readInBackgroundAndNotify();
+    if (mayReadOn(chunk)) readOn();
     throw;
   }
-  _sourceFileHandle->readInBackgroundAndNotify();
+  if (mayReadOn(chunk)) readOn();
+}
+
+void KtRCMessageAccumulator::readOn() { _sourceFileHandle->readInBackgroundAndNotify(); }
+
+bool KtRCMessageAccumulator::mayReadOn(std::size_t chunk) {
+  if (!_callersLoop) return true;
+  const std::unique_lock guard(_messageQueueLock, 0s);
+  if (!guard) return true;  // whoever has it takes a message
+  _bytesSinceEmpty = _waitingMessages.empty() ? 0 : _bytesSinceEmpty + chunk;
+  _readingRests = _waitingMessages.size() >= kMostWaitingMessages || _bytesSinceEmpty >= kMostWaitingBytes;
+  return !_readingRests;
 }
 
 void KtRCMessageAccumulator::formMessagesWithData(const platform::Data& chunk) {
@@ -194,6 +208,11 @@ std::unique_ptr<CRCMessage> KtRCMessageAccumulator::getNextMessage() {
   if (!guard || _waitingMessages.empty()) return nullptr;
   auto message = std::move(_waitingMessages.front());
   _waitingMessages.pop_front();
+  if (_waitingMessages.empty() && std::exchange(_readingRests, false)) {
+    _callersLoop->post([this, alive = std::weak_ptr(_alive)] {
+      if (!alive.expired()) readOn();
+    });
+  }
   return message;
 }
 

@@ -20,10 +20,16 @@
 #include "KtLuaTableMarshalling.h"
 #include "Locks.h"
 #include "NotificationCenter.h"
+#include "RunLoop.h"
 #include "Thread.h"
 
 // Longest frame that is kept, its length field included.
 inline constexpr std::int64_t kLargestFrame = kKtLuaLargestElement;
+
+// A reader on its caller's thread reads no more when so much has come since its queue was empty last, until it is empty
+// again: what nobody takes waits in the pipe, and its writer with it.
+inline constexpr std::size_t kMostWaitingMessages = 10'000;
+inline constexpr std::size_t kMostWaitingBytes = std::size_t{64} << 20;
 
 // Posted through the default notification center with the reader as the object, on the thread that reads:
 // once for every message put into the queue,
@@ -74,6 +80,8 @@ class KtRCMessageAccumulator {
   void observePipeForData();
   void dataWasRead(const platform::Notification& notification);
   void formMessagesWithData(const platform::Data& chunk);
+  bool mayReadOn(std::size_t chunk);
+  void readOn();
   void dropConsumedBytes(const Pass& pass);
   bool step(Pass& pass);
   bool readLength(Pass& pass);
@@ -85,6 +93,8 @@ class KtRCMessageAccumulator {
   void startReadThread();
 
   std::deque<std::unique_ptr<CRCMessage>> _waitingMessages;
+  std::size_t _bytesSinceEmpty = 0;  // read since the queue was empty
+  bool _readingRests = false;
   platform::TimedLock _messageQueueLock;
   std::shared_ptr<platform::FileHandle> _sourceFileHandle;
   std::atomic<bool> _keepActiveRunloop{false};
@@ -98,4 +108,6 @@ class KtRCMessageAccumulator {
   std::int64_t _bytesToSkip = 0;    // of a dropped frame, still to arrive
   platform::Observer _readObserver;
   std::shared_ptr<platform::Thread> _readThread;
+  std::shared_ptr<platform::RunLoop> _callersLoop;  // null with a thread of its own
+  std::shared_ptr<int> _alive = std::make_shared<int>();
 };
