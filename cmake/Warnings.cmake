@@ -9,6 +9,7 @@ target_compile_options(tether_options INTERFACE
   $<$<AND:$<COMPILE_LANGUAGE:CXX>,$<CXX_COMPILER_ID:GNU>>:-Wno-restrict>)
 
 if(TETHER_SANITIZE)
+  target_compile_definitions(tether_options INTERFACE TETHER_SANITIZED)
   target_compile_options(tether_options INTERFACE
     -fsanitize=${TETHER_SANITIZE} -fno-sanitize-recover=all -fno-omit-frame-pointer)
   target_link_options(tether_options INTERFACE -fsanitize=${TETHER_SANITIZE})

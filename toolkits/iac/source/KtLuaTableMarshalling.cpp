@@ -1,11 +1,70 @@
 #include "KtLuaTableMarshalling.h"
 
+#include <array>
 #include <cstdlib>
 #include <cstring>
 #include <functional>
 #include <memory>
+#include <new>
+#include <utility>
 
 #include "Log.h"
+
+// Memory. A table takes two blocks an entry, besides the map's own: half of what decoding costs is the general
+// allocator.
+
+namespace {
+
+#ifdef TETHER_SANITIZED
+constexpr std::size_t kMostSpare = 0;  // a block that is used after its end must be seen
+#else
+constexpr std::size_t kMostSpare = 512;  // of each size
+#endif
+// Elements have at most 64 bytes; others are left to the general allocator.
+constexpr std::size_t kStep = 16;
+constexpr std::size_t kSizes = 4;
+
+class SpareBlocks {
+ public:
+  ~SpareBlocks() {
+    while (_first != nullptr) ::operator delete(std::exchange(_first, _first->next));
+    _count = kMostSpare;  // elements that are destroyed later are not kept
+  }
+  void* take(std::size_t size) {
+    if (_first == nullptr) return ::operator new(size);
+    --_count;
+    return std::exchange(_first, _first->next);
+  }
+  void give(void* memory) {
+    if (_count >= kMostSpare) return ::operator delete(memory);
+    ++_count;
+    _first = new (memory) Block{_first};
+  }
+
+ private:
+  struct Block {
+    Block* next;
+  };
+  Block* _first = nullptr;
+  std::size_t _count = 0;
+};
+
+SpareBlocks& spareBlocks(std::size_t size) {
+  static thread_local std::array<SpareBlocks, kSizes> blocks;
+  return blocks[(size - 1) / kStep];
+}
+
+}  // namespace
+
+void* KtLuaTE::operator new(std::size_t size) {
+  if (size > kSizes * kStep) return ::operator new(size);
+  return spareBlocks(size).take((size + kStep - 1) / kStep * kStep);
+}
+
+void KtLuaTE::operator delete(void* memory, std::size_t size) noexcept {
+  if (size > kSizes * kStep) return ::operator delete(memory);
+  spareBlocks(size).give(memory);
+}
 
 // The base: what a kind does that does not know better.
 
@@ -76,9 +135,7 @@ KtLuaTEData::~KtLuaTEData() { std::free(bytes); }
 
 // Tables.
 
-KtLuaTETable::~KtLuaTETable() { destroyEntries(); }
-
-void KtLuaTETable::destroyEntries() {
+KtLuaTETable::~KtLuaTETable() {
   // The map is not asked to compare any more, so its keys may go before it does.
   for (const auto& [key, value] : entries) {
     delete key;

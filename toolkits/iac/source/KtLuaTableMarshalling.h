@@ -11,6 +11,8 @@
 #include <map>
 #include <ostream>
 #include <string>
+#include <string_view>
+#include <utility>
 
 #include "Dictionary.h"
 #include "Exception.h"
@@ -45,6 +47,8 @@ class KtMalformedElement : public platform::Exception {
   explicit KtMalformedElement(std::string reason) : Exception("Malformed Element", std::move(reason)) {}
 };
 
+class KtElementReader;
+
 class KtLuaTE {
  public:
   KtLuaTE(const KtLuaTE&) = delete;
@@ -68,6 +72,10 @@ class KtLuaTE {
   static KtLuaTE* createFromStream(std::istream& in);
 
   std::int32_t getType() const { return type; }
+
+  // A thread keeps the memory of some elements that it destroyed for those that it makes next.
+  static void* operator new(std::size_t size);
+  static void operator delete(void* memory, std::size_t size) noexcept;
 
  protected:
   explicit KtLuaTE(std::int32_t kind) : type(kind) {}
@@ -105,6 +113,7 @@ class KtLuaTENumber final : public KtLuaTE {
 class KtLuaTEString final : public KtLuaTE {
  public:
   explicit KtLuaTEString(const std::string& text) : KtLuaTE(kKtLuaTypeString), value(text) {}
+  explicit KtLuaTEString(std::string&& text) : KtLuaTE(kKtLuaTypeString), value(std::move(text)) {}
   explicit KtLuaTEString(const char* text) : KtLuaTE(kKtLuaTypeString), value(text) {}
   explicit KtLuaTEString(std::istream& in);
   bool operator<(const KtLuaTE& other) const override;
@@ -120,6 +129,7 @@ class KtLuaTEData final : public KtLuaTE {
  public:
   // Copies the bytes. Throws the integer -1 when there is no memory for them.
   KtLuaTEData(const void* source, std::int32_t count);
+  explicit KtLuaTEData(std::string_view block) : KtLuaTEData(block.data(), static_cast<std::int32_t>(block.size())) {}
   explicit KtLuaTEData(std::istream& in);
   ~KtLuaTEData() override;
   bool operator<(const KtLuaTE& other) const override;
@@ -165,7 +175,7 @@ class KtLuaTETable final : public KtLuaTE {
   const Entries& getEntries() const { return entries; }
 
  private:
-  void destroyEntries();
+  friend class KtElementReader;  // fills it
 
   Entries entries;
 };

@@ -17,6 +17,10 @@ class KtNSDataWriteStreamBuf : public std::streambuf {
   // What was written so far; it changes with later writes. A caller that needs it longer than the stream buffer lives
   // keeps a reference of its own.
   std::shared_ptr<const platform::Data> getNSData() const { return data; }
+  // The same buffer, to be changed.
+  platform::MutableData& bytes() { return *data; }
+  // Writes that many bytes, without the stream around it; returns where they are to be put.
+  char* extend(std::size_t count) { return data->extend(count); }
 
  protected:
   std::streamsize xsputn(const char* bytes, std::streamsize count) override;
@@ -32,6 +36,12 @@ class KtNSDataReadStreamBuf : public std::streambuf {
 
   // Bytes between the position and the end.
   std::int64_t available() const { return length - std::int64_t{position}; }
+  // Reads `count` bytes, at most available(), where they lie: without the stream around it.
+  const char* take(std::int64_t count) {
+    const char* const from = data->bytes() + std::int64_t{position};
+    position += count;
+    return from;
+  }
 
  protected:
   // The end of the data is where an offset from the end begins to count, backwards: +2 is two bytes before it.
