@@ -23,7 +23,8 @@ class TimedLock {
   template <typename Duration>
   bool try_lock_for(Duration wait) {
     std::unique_lock guard(_state);
-    if (!_freed.wait_for(guard, wait, [this] { return !_taken; })) return false;
+    // A free lock is had without a look at the clock.
+    if (_taken && !_freed.wait_for(guard, wait, [this] { return !_taken; })) return false;
     return _taken = true;
   }
   void unlock() {
@@ -49,7 +50,7 @@ class RecursiveTimedLock {
   template <typename Duration>
   bool try_lock_for(Duration wait) {
     std::unique_lock guard(_state);
-    if (!_freed.wait_for(guard, wait, [this] { return isFree(); })) return false;
+    if (!isFree() && !_freed.wait_for(guard, wait, [this] { return isFree(); })) return false;
     take();
     return true;
   }
