@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <chrono>
+#include <cstring>
 #include <utility>
 
 #include "KtNSDataStreamBuf.h"
@@ -16,6 +17,24 @@ constexpr auto kQueueLockWait = 10s;
 constexpr std::size_t kBufferToKeep = std::size_t{1} << 20;
 
 }  // namespace
+
+struct KtRCMessageAccumulator::Pass {
+  Pass(std::istream& stream, std::shared_ptr<const platform::Data> data)
+      : buffer(std::move(data)), in(stream), total(buffer.available()) {
+    in.rdbuf(&buffer);
+  }
+  Pass(const Pass&) = delete;
+  Pass& operator=(const Pass&) = delete;
+  ~Pass() { in.rdbuf(nullptr); }
+
+  // How many bytes have been read; of these, `position` are of steps that are done.
+  std::int64_t read() const { return total - buffer.available(); }
+
+  KtNSDataReadStreamBuf buffer;
+  std::istream& in;
+  const std::int64_t total;
+  std::int64_t position = 0;
+};
 
 KtRCMessageAccumulator::KtRCMessageAccumulator(std::shared_ptr<platform::FileHandle> source, bool fromOrchard)
     : _sourceFileHandle(std::move(source)),
@@ -82,12 +101,10 @@ void KtRCMessageAccumulator::formMessagesWithData(const platform::Data& chunk) {
   _accumulatedData->append(chunk.bytes() + skipped, chunk.length() - skipped);
 
   const auto total = static_cast<std::int64_t>(_accumulatedData->length());
-  if (total < _bytesNeeded) return;
+  if (total < (_currentMessageStage == kWholeFrame ? _currentMessage->length : _bytesNeeded)) return;
   _bytesNeeded = 0;
 
-  KtNSDataReadStreamBuf buffer(_accumulatedData);
-  std::istream in(&buffer);
-  Pass pass{in, total, 0};
+  Pass pass(_in, _accumulatedData);
   try {
     while (pass.position < pass.total && step(pass)) {
       if (_currentMessageStage == kQueue) addMessageToQueue();
@@ -128,10 +145,15 @@ bool KtRCMessageAccumulator::step(Pass& pass) {
   }
 }
 
+bool KtRCMessageAccumulator::readField(Pass& pass, std::int32_t& field) {
+  if (pass.buffer.available() < static_cast<std::int64_t>(sizeof field)) return false;
+  std::memcpy(&field, pass.buffer.take(sizeof field), sizeof field);
+  pass.position = pass.read();
+  return true;
+}
+
 bool KtRCMessageAccumulator::readLength(Pass& pass) {
-  pass.in.read(reinterpret_cast<char*>(&_currentMessage->length), sizeof _currentMessage->length);
-  if (pass.in.eof() || pass.in.fail()) return false;
-  pass.position = pass.in.tellg();
+  if (!readField(pass, _currentMessage->length)) return false;
   if (static_cast<std::int64_t>(sizeof _currentMessage->length) + _currentMessage->length > kLargestFrame) {
     dropFrame(pass, "longer than 64 MiB");
   } else {
@@ -142,9 +164,7 @@ bool KtRCMessageAccumulator::readLength(Pass& pass) {
 
 bool KtRCMessageAccumulator::readId(Pass& pass) {
   if (pass.total - pass.position < _currentMessage->length) return false;
-  pass.in.read(reinterpret_cast<char*>(&_currentMessage->id), sizeof _currentMessage->id);
-  if (pass.in.eof() || pass.in.fail()) return false;
-  pass.position = pass.in.tellg();
+  if (!readField(pass, _currentMessage->id)) return false;
   _frameConsumed = sizeof _currentMessage->id;
   _currentMessageStage = kName;
   return true;
@@ -154,7 +174,7 @@ void KtRCMessageAccumulator::readElement(Pass& pass, std::unique_ptr<KtLuaTE>& e
   constexpr std::int64_t kLargestRest = kLargestFrame - static_cast<std::int64_t>(sizeof(CRCMessage::length));
   try {
     element.reset(KtLuaTE::createFromStream(pass.in));
-    const std::int64_t end = pass.in.tellg();
+    const std::int64_t end = pass.read();
     if (_frameConsumed + end - pass.position > kLargestRest) throw KtMalformedElement("runs past 64 MiB");
     _frameConsumed += end - pass.position;
     pass.position = end;

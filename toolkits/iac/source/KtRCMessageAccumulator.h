@@ -71,11 +71,7 @@ class KtRCMessageAccumulator {
   // What the reader waits for.
   enum Stage : std::int32_t { kLength = 0, kWholeFrame = 1, kName = 2, kData = 3, kQueue = 4 };
 
-  struct Pass {
-    std::istream& in;
-    const std::int64_t total;
-    std::int64_t position;
-  };
+  struct Pass;
 
   void observePipeForData();
   void dataWasRead(const platform::Notification& notification);
@@ -84,6 +80,7 @@ class KtRCMessageAccumulator {
   void readOn();
   void dropConsumedBytes(const Pass& pass);
   bool step(Pass& pass);
+  static bool readField(Pass& pass, std::int32_t& field);
   bool readLength(Pass& pass);
   bool readId(Pass& pass);
   void readElement(Pass& pass, std::unique_ptr<KtLuaTE>& element);
@@ -100,6 +97,7 @@ class KtRCMessageAccumulator {
   std::atomic<bool> _keepActiveRunloop{false};
   // Begins at the first byte that the next step needs.
   std::shared_ptr<platform::MutableData> _accumulatedData;
+  std::istream _in{nullptr};  // kept: making one costs as much as decoding a small table
   std::unique_ptr<CRCMessage> _currentMessage;
   std::int32_t _currentMessageStage = kLength;
 
