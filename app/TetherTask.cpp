@@ -4,12 +4,10 @@
 #include <cerrno>
 #include <chrono>
 #include <cstring>
-#include <ostream>
 #include <string_view>
 
 #include "Application.h"
 #include "HostMessages.h"
-#include "KtNSDataStreamBuf.h"
 #include "Log.h"
 #include "NikonTetherService.h"
 
@@ -21,6 +19,7 @@ constexpr auto kHeartbeatInterval = 2.0s;
 constexpr auto kFirstIdleDelay = 1.0s;
 constexpr auto kIdleDelay = 0.1s;
 constexpr auto kDispatchDelay = 0.1s;
+constexpr std::size_t kFrameToKeep = 64 * 1024;  // the memory of a longer one is given back with the next
 
 struct Request {
   std::string_view name;
@@ -137,27 +136,29 @@ void TetherTask::sendHeartbeat() { sendMessage(KtLuaTEString("heartbeat"), 0, nu
 
 // Frames out.
 
-std::shared_ptr<const platform::Data> TetherTask::luaTableElementToNSData(const KtLuaTE& element) {
-  KtNSDataWriteStreamBuf buffer(0);
-  std::ostream out(&buffer);
-  element.writeToStream(out);
-  return buffer.getNSData();
-}
+void TetherTask::luaTableElementToNSData(const KtLuaTE& element) { element.writeToStream(_frameStream); }
 
 void TetherTask::sendMessage(const KtLuaTEString& name, std::int32_t id, const KtLuaTETable* data) {
-  const auto nameBytes = luaTableElementToNSData(name);
-  const auto dataBytes = data != nullptr ? luaTableElementToNSData(*data) : luaTableElementToNSData(KtLuaTENil());
-  const auto length = static_cast<std::int32_t>(sizeof id + nameBytes->length() + dataBytes->length());
-
-  // One write for the whole frame, so that nothing comes between its parts.
-  platform::MutableData frame(sizeof length + static_cast<std::size_t>(length));
+  const std::lock_guard guard(_frameLock);
+  if (_hostIsGone) return;
+  platform::MutableData& frame = _frame.bytes();
+  if (frame.capacity() > kFrameToKeep) frame.release();
+  frame.clear();
+  std::int32_t length = 0;
   frame.append(reinterpret_cast<const char*>(&length), sizeof length);
   frame.append(reinterpret_cast<const char*>(&id), sizeof id);
-  frame.append(nameBytes->bytes(), nameBytes->length());
-  frame.append(dataBytes->bytes(), dataBytes->length());
-  if (_hostIsGone) return;
-  const int error = _outputFileHandle->write(frame.bytes(), frame.length());
-  if (error != 0 && error != ECANCELED && !_hostIsGone.exchange(true)) {
-    platform::log("Writing to the host failed, no more is written: %s", std::strerror(error));
+  luaTableElementToNSData(name);
+  if (data != nullptr) {
+    luaTableElementToNSData(*data);
+  } else {
+    luaTableElementToNSData(KtLuaTENil());
   }
+  length = static_cast<std::int32_t>(frame.length() - sizeof length);
+  frame.replace(0, reinterpret_cast<const char*>(&length), sizeof length);
+
+  // One write for the whole frame, so that nothing comes between its parts.
+  const int error = _outputFileHandle->write(frame.bytes(), frame.length());
+  if (error == 0 || error == ECANCELED) return;
+  _hostIsGone = true;
+  platform::log("Writing to the host failed, no more is written: %s", std::strerror(error));
 }

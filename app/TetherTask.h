@@ -4,12 +4,14 @@
 // There is one task, on the main thread; sendMessage alone may be called from any.
 #pragma once
 
-#include <atomic>
 #include <cstdint>
 #include <memory>
+#include <mutex>
+#include <ostream>
 
 #include "FileHandle.h"
 #include "KtLuaTableMarshalling.h"
+#include "KtNSDataStreamBuf.h"
 #include "KtRCMessageAccumulator.h"
 #include "NotificationCenter.h"
 #include "RunLoop.h"
@@ -45,7 +47,8 @@ class TetherTask {
   void sendMessage(const KtLuaTEString& name, std::int32_t id, const KtLuaTETable* data);
 
  private:
-  static std::shared_ptr<const platform::Data> luaTableElementToNSData(const KtLuaTE& element);
+  // Appends the element's encoding to the frame that is being made.
+  void luaTableElementToNSData(const KtLuaTE& element);
   void notificationFromAccumulator(const platform::Notification& notification);
   void dispatchMessages();
   void dispatchMessage(CRCMessage* message);
@@ -65,7 +68,12 @@ class TetherTask {
   platform::Observer _accumulatorObserver;
   platform::Observer _terminateObserver;
   platform::Observer _wakeObserver;
-  std::atomic<bool> _hostIsGone{false};
+  std::mutex _frameLock;
+  // The frame that is being sent, and the memory for the next one. A stream is kept too: making one costs more than
+  // encoding most frames.
+  KtNSDataWriteStreamBuf _frame;
+  std::ostream _frameStream{&_frame};
+  bool _hostIsGone = false;
   std::shared_ptr<int> _alive = std::make_shared<int>();  // deferred dispatches look whether the task is still there
 };
 
