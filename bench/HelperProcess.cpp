@@ -44,6 +44,14 @@ std::int32_t numberAt(const std::vector<char>& bytes, std::size_t offset) {
   return number;
 }
 
+double statusOf(const std::string& task, const std::string& name) {
+  std::ifstream status(task + "/status");
+  for (std::string line; std::getline(status, line);) {
+    if (line.rfind(name, 0) == 0) return std::stod(line.substr(name.size()));
+  }
+  throw std::runtime_error(name + " cannot be read");
+}
+
 }  // namespace
 
 TemporaryFolder::TemporaryFolder() : _path(std::filesystem::temp_directory_path() / "tether-bench-XXXXXX") {
@@ -82,6 +90,23 @@ void waitFor(pid_t process) {
   }
 }
 
+double processorTimeOf(pid_t process) {
+  clockid_t clock{};
+  timespec used{};
+  if (clock_getcpuclockid(process, &clock) != 0 || clock_gettime(clock, &used) != 0) {
+    throw std::runtime_error("a process's processor time cannot be read");
+  }
+  return static_cast<double>(used.tv_sec) + static_cast<double>(used.tv_nsec) * 1e-9;
+}
+
+double sleepsOf(pid_t process) {
+  double sleeps = 0;
+  for (const auto& task : std::filesystem::directory_iterator("/proc/" + std::to_string(process) + "/task")) {
+    sleeps += statusOf(task.path(), "voluntary_ctxt_switches:");
+  }
+  return sleeps;
+}
+
 HelperProcess::HelperProcess(const std::string& program, const std::vector<std::string>& variables) {
   const auto toHelper = makePipe();
   const auto fromHelper = makePipe();
@@ -113,20 +138,6 @@ void HelperProcess::await(const std::string& name) {
   }
 }
 
-double HelperProcess::processorTime() const {
-  clockid_t clock{};
-  timespec used{};
-  if (clock_getcpuclockid(_process, &clock) != 0 || clock_gettime(clock, &used) != 0) {
-    throw std::runtime_error("the helper's processor time cannot be read");
-  }
-  return static_cast<double>(used.tv_sec) + static_cast<double>(used.tv_nsec) * 1e-9;
-}
+double HelperProcess::memory() const { return statusOf("/proc/" + std::to_string(_process), "VmRSS:") * 1024; }
 
-double HelperProcess::memoryFigure(const std::string& name) const {
-  std::ifstream status("/proc/" + std::to_string(_process) + "/status");
-  std::string line;
-  while (std::getline(status, line)) {
-    if (line.rfind(name, 0) == 0) return std::stod(line.substr(name.size())) * 1024;
-  }
-  throw std::runtime_error("the helper's memory cannot be read");
-}
+double HelperProcess::peakMemory() const { return statusOf("/proc/" + std::to_string(_process), "VmHWM:") * 1024; }

@@ -25,6 +25,11 @@ class TemporaryFolder {
 pid_t start(const std::string& program, const std::vector<std::string>& variables, int input = -1, int output = -1);
 void waitFor(pid_t process);
 
+// Processor time of all its threads, in seconds.
+double processorTimeOf(pid_t process);
+// How often its threads have gone to sleep.
+double sleepsOf(pid_t process);
+
 class HelperProcess {
  public:
   HelperProcess(const std::string& program, const std::vector<std::string>& variables);
@@ -36,11 +41,10 @@ class HelperProcess {
   // Reads frames up to the next one of that name. Throws std::runtime_error when the helper ends before.
   void await(const std::string& name);
 
-  // Processor time of all its threads, in seconds.
-  double processorTime() const;
+  pid_t process() const { return _process; }
   // Resident memory, now and the most that it has had at a time, in bytes.
-  double memory() const { return memoryFigure("VmRSS:"); }
-  double peakMemory() const { return memoryFigure("VmHWM:"); }
+  double memory() const;
+  double peakMemory() const;
 
  private:
   std::string nextName();

@@ -6,10 +6,14 @@
 
 namespace {
 
+constexpr std::array kUnitNames{"seconds", "bytes", "share", "count"};  // in the enumeration's order
+
 std::string scaled(double value, Unit unit) {
   char text[32];
   if (unit == Unit::bytes) {
     std::snprintf(text, sizeof text, "%.1f MiB", value / (1 << 20));
+  } else if (unit == Unit::count) {
+    std::snprintf(text, sizeof text, "%.0f", value);
   } else if (unit == Unit::share) {
     std::snprintf(text, sizeof text, "%.3f %%", value * 100);
   } else if (value < 1e-6) {
@@ -52,7 +56,7 @@ void Report::add(Row row) {
 
 std::string Report::table() const {
   std::string text = line({"metric", "ours", "peer/limit", "ratio", "goal", "met"});
-  for (const Row& row : _rows) text += line(row);
+  for (const Row& row : _rows) text += row.point ? "" : line(row);
   return text;
 }
 
@@ -63,6 +67,8 @@ std::string Report::json() const {
         {"metric", row.metric}, {"ours", row.ours}, {"reference", row.reference}, {"ratio", row.ratio()}};
     entry["goal"] = row.goal ? nlohmann::ordered_json(*row.goal) : nlohmann::ordered_json();
     entry["met"] = row.goal ? nlohmann::ordered_json(row.met()) : nlohmann::ordered_json();
+    entry["unit"] = kUnitNames.at(static_cast<std::size_t>(row.unit));
+    if (row.point) entry.update({{"series", row.point->series}, {"x", row.point->x}});
     list.push_back(std::move(entry));
   }
   return list.dump(2) + "\n";

@@ -8,4 +8,4 @@ void measurePictures(Report& report);     // from the first delivery to the file
 void measureFrameReader(Report& report);  // bytes to messages
 void measureCodec(Report& report);        // elements to bytes and back
 void measureSdkSide(Report& report);      // callbacks across threads, polling
-void measureSending(Report& report);      // frames out
+void measureTask(Report& report);         // frames out, idle passes

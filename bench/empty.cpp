@@ -1,1 +1,3 @@
+#include <iostream>  // needs the C++ runtime, as every program in C++ does
+
 int main() {}

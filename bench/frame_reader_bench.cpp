@@ -1,13 +1,20 @@
-// The frame reader, fed through the notification that a completed read posts.
+// The frame reader, fed through the notification that a completed read posts, beside another library's streaming
+// reader.
 #include <fcntl.h>
 
+#include <cstdlib>
 #include <cstring>
 #include <memory>
+#include <msgpack.hpp>
 #include <sstream>
+#include <utility>
+#include <vector>
 
+#include "Heap.h"
 #include "KtRCMessageAccumulator.h"
 #include "Measure.h"
 #include "Suites.h"
+#include "Tables.h"
 
 namespace {
 
@@ -39,61 +46,128 @@ Chunks cut(const std::string& bytes, std::size_t size) {
   return chunks;
 }
 
-// A whole frame of that size, cut as reads from a pipe cut it.
-Chunks largeFrame(std::size_t size) {
+// A whole frame of that size, cut as reads from a pipe cut it unless told.
+Chunks largeFrame(std::size_t size, std::size_t chunk = kChunk) {
   const std::size_t around = frame("file", KtLuaTEData("", 0)).size();
   const std::vector<char> bytes(size - around, 'x');
-  return cut(frame("file", KtLuaTEData(bytes.data(), static_cast<std::int32_t>(bytes.size()))), kChunk);
+  return cut(frame("file", KtLuaTEData(bytes.data(), static_cast<std::int32_t>(bytes.size()))), chunk);
 }
 
-Chunks smallFrames(int count) {
-  const std::string one = frame("heartbeat", KtLuaTENil());
+std::string repeated(const std::string& one, std::size_t count) {
   std::string all;
-  for (int number = 0; number < count; ++number) all += one;
-  return cut(all, all.size());
+  for (std::size_t number = 0; number < count; ++number) all += one;
+  return all;
 }
 
+// Each message is taken as soon as it is announced.
 Body reading(Chunks chunks) {
   return [chunks = std::move(chunks)](benchmark::State& state) {
     const auto handle = std::make_shared<platform::FileHandle>(open("/dev/null", O_RDONLY | O_CLOEXEC));
     KtRCMessageAccumulator reader(handle);
+    std::size_t count = 0;
+    const auto observer = platform::NotificationCenter::defaultCenter().addObserver(
+        std::string(kMessageIsAvailable), &reader, [&](const auto&) { count += reader.getNextMessage() ? 1 : 0; });
     for ([[maybe_unused]] auto _ : state) {
+      count = 0;
       for (const auto& chunk : chunks) {
         platform::NotificationCenter::defaultCenter().post(
             {platform::kFileHandleReadCompletionNotification, handle.get(), chunk});
       }
-      if (!reader.getNextMessage()) state.SkipWithError("no message");
-      while (reader.getNextMessage()) {
-      }
+      if (count == 0) state.SkipWithError("no message");
     }
   };
 }
 
+// The same values as one array each, read as the library's documentation shows.
+Body unpacking(const std::string& bytes, std::size_t chunk) {
+  return [bytes, chunk](benchmark::State& state) {
+    for ([[maybe_unused]] auto _ : state) {
+      msgpack::unpacker unpacker;
+      std::size_t messages = 0;
+      for (std::size_t from = 0; from < bytes.size(); from += chunk) {
+        const std::size_t count = std::min(chunk, bytes.size() - from);
+        unpacker.reserve_buffer(count);
+        std::memcpy(unpacker.buffer(), bytes.data() + from, count);
+        unpacker.buffer_consumed(count);
+        for (msgpack::object_handle message; unpacker.next(message);) ++messages;
+      }
+      if (messages == 0) state.SkipWithError("no message");
+    }
+  };
+}
+
+void compareFrames(Report& report, const std::string& name, double goal, const std::string& ours,
+                   const std::string& theirs) {
+  constexpr std::size_t kCount = 20'000;
+  compare(report, name + ", chunks of 64 KiB / msgpack-cxx, streaming", goal, Count::processor,
+          reading(cut(repeated(ours, kCount), kChunk)), unpacking(repeated(theirs, kCount), kChunk));
+}
+
+// What there is to do at the least: the frame's bytes come to stand in memory of its own.
 void copying(benchmark::State& state) {
   const std::vector<char> source(32 * kMiB, 'x');
-  std::vector<char> destination(source.size());
   for ([[maybe_unused]] auto _ : state) {
-    std::memcpy(destination.data(), source.data(), source.size());
-    benchmark::DoNotOptimize(destination.data());
+    const std::unique_ptr<void, void (*)(void*)> copy(std::malloc(source.size()), std::free);
+    std::memcpy(copy.get(), source.data(), source.size());
+    benchmark::DoNotOptimize(copy.get());
     benchmark::ClobberMemory();
   }
 }
 
-void addGrowth(Report& report, const std::string& metric, const std::vector<double>& times) {
-  for (std::size_t index = 1; index < times.size(); ++index) {
-    report.add({metric + (index == 1 ? ": second / first" : ": third / second"), times[index], times[index - 1],
-                Unit::seconds, kLinear});
+// What the messages of these chunks take while none is taken.
+double memoryOf(const Chunks& chunks) {
+  const auto handle = std::make_shared<platform::FileHandle>(open("/dev/null", O_RDONLY | O_CLOEXEC));
+  KtRCMessageAccumulator reader(handle);
+  const std::size_t before = heapInUse();
+  for (const auto& chunk : chunks) {
+    platform::NotificationCenter::defaultCenter().post(
+        {platform::kFileHandleReadCompletionNotification, handle.get(), chunk});
+  }
+  return static_cast<double>(heapInUse() - before);
+}
+
+// Each input is about twice the one before. They are points of curves, and the last three are rows.
+void addGrowth(Report& report, const std::string& metric, const std::string& series,
+               const std::vector<std::pair<double, Chunks>>& inputs) {
+  std::vector<Body> bodies;
+  for (const auto& [x, chunks] : inputs) bodies.push_back(reading(chunks));
+  const std::vector<double> times = medians(Count::processor, bodies);
+  for (std::size_t index = 0; index < inputs.size(); ++index) {
+    const double x = inputs[index].first;
+    report.add({metric, times[index], times[0] * x / inputs[0].first, Unit::seconds, {}, Point{series, x}});
+    const double memory = memoryOf(inputs[index].second);
+    report.add({metric, memory, memoryOf(inputs[0].second) * x / inputs[0].first, Unit::bytes, {}, Point{series, x}});
+  }
+  for (std::size_t index = inputs.size() - 2; index < inputs.size(); ++index) {
+    report.add({metric + (index + 1 < inputs.size() ? ": second / first" : ": third / second"), times[index],
+                times[index - 1], Unit::seconds, kLinear});
   }
 }
 
 }  // namespace
 
 void measureFrameReader(Report& report) {
-  const auto large = medians(Count::processor, {reading(largeFrame(8 * kMiB)), reading(largeFrame(16 * kMiB)),
-                                                reading(largeFrame(32 * kMiB)), copying});
-  report.add({"a frame of 32 MiB in chunks of 64 KiB / memcpy of 32 MiB", large[2], large[3], Unit::seconds, {}});
-  addGrowth(report, "a frame of 8, 16, 32 MiB", {large[0], large[1], large[2]});
-  addGrowth(report, "25, 50, 100 thousand frames in one chunk",
-            medians(Count::processor,
-                    {reading(smallFrames(25'000)), reading(smallFrames(50'000)), reading(smallFrames(100'000))}));
+  const auto tables = settings();
+  const std::string heartbeat = frame("heartbeat", KtLuaTENil());
+  compareFrames(report, "heartbeats", 1.0, heartbeat, packedMessage("heartbeat", nullptr));
+  compareFrames(report, "frames of the 7 settings", 2.5, frame("cameraSettingsChanged", tables->ours),
+                packedMessage("cameraSettingsChanged", tables.get()));
+
+  const auto large = medians(Count::processor, {reading(largeFrame(32 * kMiB)), copying});
+  report.add({"a frame of 32 MiB in chunks of 64 KiB / malloc and memcpy", large[0], large[1], Unit::seconds, 1.5});
+
+  std::vector<std::pair<double, Chunks>> inputs;
+  for (const int size : {1, 2, 4, 8, 16, 32})
+    inputs.emplace_back(size, largeFrame(static_cast<std::size_t>(size) * kMiB));
+  addGrowth(report, "a frame of 8, 16, 32 MiB", "MiB in one frame", inputs);
+  inputs.clear();
+  for (const int count : {12'500, 25'000, 50'000, 100'000}) {
+    const std::string all = repeated(heartbeat, static_cast<std::size_t>(count));
+    inputs.emplace_back(count, cut(all, all.size()));
+  }
+  addGrowth(report, "25, 50, 100 thousand frames in one chunk", "frames in one chunk", inputs);
+  inputs.clear();
+  for (const int size : {128, 256, 512, 1024})
+    inputs.emplace_back(size, largeFrame(static_cast<std::size_t>(size) * 1024, 1));
+  addGrowth(report, "a frame of 1/4, 1/2, 1 MiB, 1 byte a chunk", "KiB in one frame, 1 byte a chunk", inputs);
 }

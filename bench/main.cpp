@@ -22,7 +22,7 @@ struct Suite {
 // Whole processes first, while this one is small and has no other thread.
 constexpr std::array kSuites{Suite{"process", measureProcesses},  Suite{"pictures", measurePictures},
                              Suite{"reader", measureFrameReader}, Suite{"codec", measureCodec},
-                             Suite{"sdk", measureSdkSide},        Suite{"sending", measureSending}};
+                             Suite{"sdk", measureSdkSide},        Suite{"task", measureTask}};
 
 }  // namespace
 
@@ -34,7 +34,7 @@ int main(int argc, char** argv) {
     if (std::strcmp(argv[index], "--only") == 0) only = argv[index + 1];
   }
   if (argc % 2 == 0 || (argc > 1 && file.empty() && only.empty())) {
-    std::fputs("usage: tether_bench [--json FILE] [--only process|pictures|reader|codec|sdk|sending]\n", stderr);
+    std::fputs("usage: tether_bench [--json FILE] [--only process|pictures|reader|codec|sdk|task]\n", stderr);
     return 2;
   }
   std::string turns = "--benchmark_enable_random_interleaving=true";
@@ -47,6 +47,7 @@ int main(int argc, char** argv) {
   platform::setLogSink([](const std::string&) {});
   Report report;
   for (const Suite& suite : kSuites) {
+    malloc_trim(0);  // of what the suite before has left
     if (only.empty() || only == suite.name) suite.run(report);
   }
   std::fputs(report.table().c_str(), stdout);

@@ -1,6 +1,6 @@
-// A camera module with pictures that are stored nowhere: TETHER_BENCH_PICTURES="COUNT BYTES" says how many its one
-// camera holds from the start, and how large each is. Every byte that comes through the named pipe TETHER_BENCH_SHUTTER
-// is one more.
+// A camera module with pictures that are stored nowhere: TETHER_BENCH_PICTURES="COUNT BYTES" says how many its first
+// camera holds from the start, and how large each is; TETHER_BENCH_CAMERAS, how many cameras there are, one unless
+// told. Every byte that comes through the named pipe TETHER_BENCH_SHUTTER is one more picture.
 #include <fcntl.h>
 #include <unistd.h>
 
@@ -34,6 +34,9 @@ class Blank final : public virtualcamera::PictureSource {
 virtualcamera::Model* makeModel() {
   auto* const model = new virtualcamera::Model;  // lives as long as the process
   virtualcamera::Camera& camera = model->addCamera(1, "Pattern");
+  const char* const cameras = std::getenv("TETHER_BENCH_CAMERAS");
+  const unsigned long last = cameras == nullptr ? 1 : std::strtoul(cameras, nullptr, 10);
+  for (unsigned long id = 2; id <= last; ++id) model->addCamera(static_cast<std::uint32_t>(id), "Pattern");
   const char* const pictures = std::getenv("TETHER_BENCH_PICTURES");
   if (pictures == nullptr) return model;
   char* end = nullptr;

@@ -1,11 +1,16 @@
 // The helper's start, its idling and its end.
 #include <dlfcn.h>
+#include <poll.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <array>
 #include <chrono>
+#include <csignal>
 #include <stdexcept>
 #include <thread>
+#include <utility>
+#include <vector>
 
 #include "HelperProcess.h"
 #include "MAID.h"
@@ -22,6 +27,8 @@ constexpr double kStartLimit = 0.050;
 constexpr double kIdleLimit = 0.01;
 constexpr auto kSettled = 2s;  // behind the first idle pass
 constexpr auto kIdleTime = 10s;
+constexpr double kIdleSeconds = 10;
+constexpr int kSleeperWait = 77;  // milliseconds: about as often as the helper, which is made up for
 
 double since(Clock::time_point start) { return std::chrono::duration<double>(Clock::now() - start).count(); }
 
@@ -86,14 +93,61 @@ double startToEnd(const std::string& program) {
   return since(begin);
 }
 
-double idleShare() {
-  HelperProcess helper(BENCH_HELPER, {});
+// A process that wakes again and again for nothing. Like all that have an input and can be woken, it watches two pipes.
+pid_t startSleeper() {
+  const pid_t child = fork();
+  if (child != 0) return child;
+  std::array<pollfd, 2> watched{};
+  for (pollfd& input : watched) {
+    std::array<int, 2> ends{};
+    if (pipe(ends.data()) != 0) _exit(1);
+    input = {ends[0], POLLIN, 0};
+  }
+  while (true) poll(watched.data(), watched.size(), kSleeperWait);
+}
+
+struct Idle {
+  double ours;     // processor time in kIdleTime, in seconds
+  double sleeper;  // of a process that wakes as often, at the same time
+};
+
+Idle idle(const char* program, int cameras) {
+  HelperProcess helper(program, {"TETHER_BENCH_CAMERAS=" + std::to_string(cameras)});
   helper.await("deviceAdded");
+  const pid_t sleeper = startSleeper();
   std::this_thread::sleep_for(kSettled);
-  const double before = helper.processorTime();
-  const auto start = Clock::now();
+  const auto now = [](pid_t process) { return std::pair(processorTimeOf(process), sleepsOf(process)); };
+  const auto before = std::pair(now(helper.process()), now(sleeper));
   std::this_thread::sleep_for(kIdleTime);
-  return (helper.processorTime() - before) / since(start);
+  const auto after = std::pair(now(helper.process()), now(sleeper));
+  kill(sleeper, SIGKILL);
+  waitFor(sleeper);
+  const double sleeps = after.first.second - before.first.second;
+  const double sleeperSleeps = after.second.second - before.second.second;
+  return {after.first.first - before.first.first, (after.second.first - before.second.first) * sleeps / sleeperSleeps};
+}
+
+// Start until the last camera is told, and the memory by then.
+void addCameras(Report& report) {
+  const std::string name = "cameras of one module";
+  double seconds = 0;
+  double bytes = 0;
+  for (const int cameras : {1, 32, 64, 128, 255}) {
+    std::vector<double> times;
+    std::vector<double> memory;
+    for (int turn = 0; turn < kTurns; ++turn) {
+      const auto start = Clock::now();
+      HelperProcess helper(BENCH_HELPER_WITH_PICTURES, {"TETHER_BENCH_CAMERAS=" + std::to_string(cameras)});
+      for (int camera = 0; camera < cameras; ++camera) helper.await("deviceAdded");
+      times.push_back(since(start));
+      memory.push_back(helper.peakMemory());
+    }
+    if (cameras == 1) seconds = median(times);
+    if (cameras == 1) bytes = median(memory);
+    report.add(
+        {"start to the last deviceAdded", median(times), seconds, Unit::seconds, {}, Point{name, 1.0 * cameras}});
+    report.add({"peak memory", median(memory), bytes, Unit::bytes, {}, Point{name, 1.0 * cameras}});
+  }
 }
 
 }  // namespace
@@ -102,9 +156,27 @@ void measureProcesses(Report& report) {
   const auto [startUp, module] = medianTurns(kTurns, startUpTime, moduleTime);
   report.add({"start to first deviceAdded, without the module's own / 50 ms", std::max(startUp - module, 0.0),
               kStartLimit, Unit::seconds, 1.0});
-  const auto [ours, empty] = medianTurns(
+  const auto [whole, empty] = medianTurns(
       kTurns * 3, [] { return startToEnd(BENCH_HELPER_WITHOUT_MODULES); },
       [] { return startToEnd(BENCH_EMPTY_PROGRAM); });
-  report.add({"start to end at closed input, no modules / empty program", ours, empty, Unit::seconds, 1.5});
-  report.add({"idle with one module, share of a core over 10 s / 1 %", idleShare(), kIdleLimit, Unit::share, 1.0});
+  report.add({"start to end at closed input, no modules / empty program", whole, empty, Unit::seconds, 1.5});
+  std::vector<Idle> one;
+  std::vector<Idle> all;
+  for (int turn = 0; turn < 3; ++turn) {
+    one.push_back(idle(BENCH_HELPER_WITH_PICTURES, 10));
+    all.push_back(idle(BENCH_HELPER_WITH_ALL_MODULES, 10));
+  }
+  const auto middle = [](const std::vector<Idle>& turns, double Idle::*figure) {
+    std::vector<double> figures;
+    for (const Idle& turn : turns) figures.push_back(turn.*figure);
+    return median(figures);
+  };
+  const double ours = middle(one, &Idle::ours);
+  report.add(
+      {"idle with one module, share of a core over 10 s / 1 %", ours / kIdleSeconds, kIdleLimit, Unit::share, 1.0});
+  report.add({"idle with one module / a bare poll loop that wakes as often", ours, middle(one, &Idle::sleeper),
+              Unit::seconds, 1.3});
+  report.add(
+      {"idle with 17 modules of 10 cameras / 17 times one", middle(all, &Idle::ours), 17 * ours, Unit::seconds, 1.0});
+  addCameras(report);
 }
