@@ -10,10 +10,9 @@
 #include <array>
 #include <cerrno>
 #include <csignal>
-#include <cstring>
 #include <fstream>
+#include <iterator>
 #include <random>
-#include <sstream>
 #include <stdexcept>
 #include <thread>
 
@@ -52,10 +51,21 @@ Message decoded(const std::string& bytes) {
   return message;
 }
 
+KtLuaTE& valueOf(const Message& message, const char* key, std::int32_t kind) {
+  KtLuaTE* const found = message.value(key);
+  if (found == nullptr || found->getType() != kind) throw std::runtime_error(message.name + " without " + key);
+  return *found;
+}
+
 std::size_t waiting(int pipe) {
   int count = 0;
   ioctl(pipe, FIONREAD, &count);
   return static_cast<std::size_t>(count);
+}
+
+void closeOnce(int& descriptor) {
+  if (descriptor >= 0) close(descriptor);
+  descriptor = -1;
 }
 
 }  // namespace
@@ -65,17 +75,10 @@ KtLuaTE* Message::value(const char* key) const {
   return table == nullptr ? nullptr : table->elementForKey(key);
 }
 
-double Message::number(const char* key) const {
-  KtLuaTE* const found = value(key);
-  if (found == nullptr || found->getType() != kKtLuaTypeNumber)
-    throw std::runtime_error(std::string("no number ") + key);
-  return static_cast<double>(*found);
-}
+double Message::number(const char* key) const { return static_cast<double>(valueOf(*this, key, kKtLuaTypeNumber)); }
 
 std::string Message::text(const char* key) const {
-  const KtLuaTE* const found = value(key);
-  if (found == nullptr || found->getType() != kKtLuaTypeString) throw std::runtime_error(std::string("no text ") + key);
-  return static_cast<std::string>(*found);
+  return static_cast<std::string>(valueOf(*this, key, kKtLuaTypeString));
 }
 
 bool Message::isNil(const char* key) const {
@@ -146,10 +149,13 @@ void Helper::install(const std::string& bundle, const std::string& library, cons
   fs::copy_file(library, contents / (executable.empty() ? bundle : executable));
 }
 
+fs::path Helper::executable() const {
+  return folder_ / "TetherHelper.app/Contents" / TETHER_BUNDLE_PLATFORM / "TetherHelper";
+}
+
 void Helper::start() {
-  const fs::path executable = folder_ / "TetherHelper.app/Contents" / TETHER_BUNDLE_PLATFORM / "TetherHelper";
-  fs::create_directories(executable.parent_path());
-  fs::copy_file(TETHER_HELPER, executable);
+  fs::create_directories(executable().parent_path());
+  fs::copy_file(TETHER_HELPER, executable());
   std::array<int, 2> input{};
   std::array<int, 2> output{};
   if (pipe(input.data()) != 0 || pipe(output.data()) != 0) throw std::runtime_error("no pipes");
@@ -182,8 +188,7 @@ void Helper::runChild(int input, int output) {
   }
   setenv("TSAN_OPTIONS", "halt_on_error=1", 0);  // a race is no good end
   std::signal(SIGPIPE, SIG_DFL);
-  const std::string executable = folder_ / "TetherHelper.app/Contents" / TETHER_BUNDLE_PLATFORM / "TetherHelper";
-  execl(executable.c_str(), executable.c_str(), nullptr);
+  execl(executable().c_str(), executable().c_str(), nullptr);
   _exit(127);
 }
 
@@ -202,15 +207,9 @@ void Helper::send(const std::string& bytes) {
   }
 }
 
-void Helper::closeInput() {
-  if (input_ >= 0) close(input_);
-  input_ = -1;
-}
+void Helper::closeInput() { closeOnce(input_); }
 
-void Helper::closeOutput() {
-  if (output_ >= 0) close(output_);
-  output_ = -1;
-}
+void Helper::closeOutput() { closeOnce(output_); }
 
 void Helper::narrowOutput() const {
 #ifdef F_SETPIPE_SZ
@@ -321,20 +320,15 @@ void awaitCondition(const std::string& what, const std::function<bool()>& condit
 }
 
 std::string pattern(std::size_t size, unsigned seed) {
-  std::mt19937 random(seed);
+  std::minstd_rand random(seed);
   std::string bytes(size, '\0');
-  for (std::size_t i = 0; i + 4 <= size; i += 4) {
-    const auto word = static_cast<std::uint32_t>(random());
-    std::memcpy(bytes.data() + i, &word, sizeof word);
-  }
+  for (char& byte : bytes) byte = static_cast<char>(random() >> 8);
   return bytes;
 }
 
 std::string readFile(const fs::path& path) {
   std::ifstream file(path, std::ios::binary);
-  std::ostringstream text;
-  text << file.rdbuf();
-  return text.str();
+  return {std::istreambuf_iterator<char>(file), {}};
 }
 
 void drop(const fs::path& path, const std::string& bytes) {

@@ -93,7 +93,8 @@ class Helper {
  private:
   using Match = std::function<bool(const Message&)>;
 
-  void runChild(int input, int output);
+  std::filesystem::path executable() const;
+  [[noreturn]] void runChild(int input, int output);
   const Message* find(const Match& match, Clock::time_point limit);
   const Message& awaitMatch(const std::string& what, const Match& match);
   bool readUntil(Clock::time_point limit);  // false: the limit, or the end of the output

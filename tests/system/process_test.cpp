@@ -11,10 +11,19 @@ namespace {
 using namespace std::chrono_literals;
 namespace fs = std::filesystem;
 
-class Process : public HelperTest {};
+const char* const kSlow = R"({"transfer": {"deliveryBytes": 1000, "bytesPerSecond": 1000}})";
 
-// So much in a narrowed pipe leaves no room for what is still to be answered, and no frame is so long that less stays.
-constexpr std::size_t kNearlyFull = 3000;
+class Process : public HelperTest {
+ protected:
+  // Answers fill the narrowed pipe, so that the main thread waits for a host that does not read.
+  void fillOutput(std::int32_t requests) {
+    helper.narrowOutput();
+    std::string all;
+    for (std::int32_t id = 10; id < 10 + requests; ++id) all += request("connectDevice", id, 0x0109);
+    helper.send(all);
+    awaitCondition("full pipe", [&] { return helper.unread() > 3000; });  // no frame is so long that less stays
+  }
+};
 
 TEST_F(Process, WithoutModulesSendsHeartbeatsAndAnswersNoRequestThatNamesADevice) {
   using namespace std::string_literals;
@@ -30,40 +39,32 @@ TEST_F(Process, WithoutModulesSendsHeartbeatsAndAnswersNoRequestThatNamesADevice
   EXPECT_EQ(helper.count("heartbeat"), helper.messages().size());
 }
 
-TEST_F(Process, EndsWithStatusZeroWhenItsInputEndsAndOnShutdown) {
-  helper.start();
-  helper.closeInput();
-  EXPECT_EQ(helper.wait(), 0);
-
-  Helper other;
-  other.start();
-  other.send(request("shutdown", 1));
-  EXPECT_EQ(other.wait(), 0);
+TEST_F(Process, EndsWithItsInputOrASignalAndTakesAFileThatIsNotWholeAlong) {
+  for (const int signal : {0, SIGTERM, SIGINT}) {
+    Helper other;
+    other.install("Type0001Module", VIRTUAL_CAMERA_MODULE);
+    drop(other.cameras() / "1-Studio/camera.json", kSlow);
+    drop(other.cameras() / "1-Studio/1.jpg", pattern(1'000'000, 1));
+    other.start();
+    other.await("objectWasAdded");
+    EXPECT_TRUE(fs::exists(other.temporary() / "Capture0001.jpg"));
+    signal == 0 ? other.closeInput() : static_cast<void>(kill(other.pid(), signal));
+    EXPECT_EQ(other.wait(), 0);
+    EXPECT_EQ(other.count("fileDownloadComplete"), 0U);
+    EXPECT_TRUE(fs::is_empty(other.temporary()));
+  }
 }
 
-TEST_F(Process, EndsWithStatusZeroOnSignalsEvenInTheMiddleOfATransfer) {
-  startWithCamera(R"({"transfer": {"deliveryBytes": 1000, "bytesPerSecond": 1000}})");
-  drop(studio() / "a.jpg", pattern(1000000, 1));
+TEST_F(Process, BringsATransferToItsEndOnShutdownAndCarriesOutNothingBehindIt) {
+  startWithCamera(R"({"transfer": {"deliveryBytes": 1000, "bytesPerSecond": 10000}})");
+  for (const char* name : {"1.jpg", "2.jpg", "3.jpg"}) drop(studio() / name, pattern(5000, 1));
   helper.await("objectWasAdded");
-  kill(helper.pid(), SIGTERM);
-  EXPECT_EQ(helper.wait(), 0);
-  EXPECT_EQ(helper.count("fileDownloadComplete"), 0U);
-
-  Helper other;
-  other.install("Type0001Module", VIRTUAL_CAMERA_MODULE);
-  fs::create_directories(other.cameras() / "1-Studio");
-  other.start();
-  other.await("deviceAdded");
-  kill(other.pid(), SIGINT);
-  EXPECT_EQ(other.wait(), 0);
-}
-
-TEST_F(Process, CarriesOutNothingBehindShutdown) {
-  startWithCamera();
-  helper.send(request("connectDevice", 1, kStudio) + request("shutdown", 2) + request("getCameraSettings", 3, kStudio));
+  helper.send(request("connectDevice", 1, kStudio) + request("shutdown", 2) + request("connectDevice", 3, 0x0109));
   EXPECT_EQ(helper.wait(), 0);
   EXPECT_EQ(helper.awaitAnswer(1).name, "ok");
   for (const Message& message : helper.messages()) EXPECT_NE(message.id, 3);
+  EXPECT_EQ(helper.count("objectWasAdded"), helper.count("fileDownloadComplete"));
+  EXPECT_TRUE(readFile(helper.await("fileDownloadComplete").text("file_path")) == pattern(5000, 1));
 }
 
 TEST_F(Process, OutlivesAHostThatStoppedReadingUntilItsInputEnds) {
@@ -79,16 +80,12 @@ TEST_F(Process, OutlivesAHostThatStoppedReadingUntilItsInputEnds) {
 }
 
 TEST_F(Process, LosesNothingOfEitherThreadWhileTheHostDoesNotRead) {
-  startWithCamera();
-  connect(kStudio);
-  helper.narrowOutput();
   constexpr std::int32_t kRequests = 200;
   constexpr int kPictures = 30;
-  std::string requests;
-  for (std::int32_t id = 10; id < 10 + kRequests; ++id) requests += request("connectDevice", id, 0x0109);
+  startWithCamera();
+  connect(kStudio);
   for (int i = 0; i < kPictures; ++i) drop(studio() / (std::to_string(i) + ".jpg"), pattern(1000, 1));
-  helper.send(requests);
-  awaitCondition("full pipe", [&] { return helper.unread() > kNearlyFull; });
+  fillOutput(kRequests);
   std::size_t place = 0;
   for (std::int32_t id = 10; id < 10 + kRequests; ++id) {
     const Message& error = helper.awaitAnswer(id);
@@ -98,37 +95,18 @@ TEST_F(Process, LosesNothingOfEitherThreadWhileTheHostDoesNotRead) {
   for (int i = 1; i <= kPictures; ++i) EXPECT_EQ(helper.await("fileDownloadComplete").number("capture_id"), i);
 }
 
-// A helper whose main thread waits for a host that does not read.
-class HeldUp : public Process {
- protected:
-  HeldUp() {
-    startWithCamera();
-    helper.narrowOutput();
-    std::string requests;
-    for (std::int32_t id = 10; id < 210; ++id) requests += request("connectDevice", id, 0x0109);
-    helper.send(requests);
-    awaitCondition("full pipe", [&] { return helper.unread() > kNearlyFull; });
-  }
-};
-
-TEST_F(HeldUp, EndsOnASignal) {
+TEST_F(Process, EndsOnASignalWhileItWaitsForAHostThatDoesNotRead) {
+  startWithCamera();
+  fillOutput(200);
   kill(helper.pid(), SIGTERM);
   EXPECT_EQ(helper.wait(Helper::Reading::no), 0);
 }
 
-TEST_F(HeldUp, EndsWithItsInput) {
+TEST_F(Process, EndsWithItsInputWhileItWaitsForAHostThatDoesNotRead) {
+  startWithCamera();
+  fillOutput(200);
   helper.closeInput();
   EXPECT_EQ(helper.wait(Helper::Reading::no), 0);
-}
-
-TEST_F(Process, TakesAFileThatIsNotWholeAlongWhenItEnds) {
-  startWithCamera(R"({"transfer": {"deliveryBytes": 1000, "bytesPerSecond": 1000}})");
-  drop(studio() / "1.jpg", pattern(1'000'000, 1));
-  helper.await("objectWasAdded");
-  EXPECT_TRUE(fs::exists(helper.temporary() / "Capture0001.jpg"));
-  helper.closeInput();
-  EXPECT_EQ(helper.wait(), 0);
-  EXPECT_TRUE(fs::is_empty(helper.temporary()));
 }
 
 }  // namespace
