@@ -1,15 +1,13 @@
 // A scripted helper for one test: its script, what it noted, and a folder that goes with it.
 #pragma once
 
+#include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <sys/stat.h>
-#include <sys/types.h>
 #include <unistd.h>
 
-#include <cerrno>
+#include <algorithm>
 #include <chrono>
 #include <csignal>
-#include <cstdlib>
 #include <filesystem>
 #include <fstream>
 #include <functional>
@@ -35,6 +33,8 @@ inline bool eventually(const std::function<bool()>& holds) {
   }
   return true;
 }
+
+inline bool isGone(pid_t process) { return kill(process, 0) != 0 && errno == ESRCH; }
 
 class Folder {
  public:
@@ -74,14 +74,11 @@ class Helper {
  public:
   explicit Helper(const std::string& script) { _folder.write("script.json", script); }
 
-  static std::string path() { return FAKE_HELPER; }
   std::vector<std::string> environment() const {
     return {"FAKE_HELPER_SCRIPT=" + (_folder / "script.json"), "FAKE_HELPER_LOG=" + (_folder / "log")};
   }
-  const Folder& folder() const { return _folder; }
-
-  // What it noted so far, and the part of each line behind a word.
-  std::vector<std::string> notes(const std::string& word = "") const {
+  // What it noted so far: the part of each line behind a word.
+  std::vector<std::string> notes(const std::string& word) const {
     std::vector<std::string> found;
     std::istringstream lines(_folder.read("log"));
     for (std::string line; std::getline(lines, line);) {
@@ -92,20 +89,18 @@ class Helper {
   bool awaitNote(const std::string& word) const {
     return eventually([&] { return !notes(word).empty(); });
   }
-  // The nth start's process, once it has begun.
+  // The nth start's process, once it has begun, and its temporary directory.
   pid_t process(std::size_t nth = 0) const {
     eventually([&] { return notes("start ").size() > nth; });
     return static_cast<pid_t>(std::stol(notes("start ").at(nth)));
   }
-  std::string directory(std::size_t nth = 0) const {
-    const std::string line = notes("start ").at(nth);
+  std::string directory() const {
+    const std::string line = notes("start ").at(0);
     return line.substr(line.find(' ') + 1);
   }
 
  private:
   Folder _folder;
 };
-
-inline bool isGone(pid_t process) { return kill(process, 0) != 0 && errno == ESRCH; }
 
 }  // namespace fake
