@@ -23,7 +23,7 @@ class Callbacks : public ::testing::Test {
   std::unique_ptr<SpyObject> root;
 };
 
-TEST_F(Callbacks, ReachTheMostDerivedObjectOrNothingAtAll) {
+TEST_F(Callbacks, ReachTheMostDerivedObjectOrNothingAtAllAndThrowNothingIntoTheSdk) {
   std::int32_t heard = -1;
   root->onEvent = [&](std::int32_t event, void* data) {
     heard = event + static_cast<std::int32_t>(reinterpret_cast<std::uintptr_t>(data));
@@ -32,33 +32,27 @@ TEST_F(Callbacks, ReachTheMostDerivedObjectOrNothingAtAll) {
   MAIDEventHandler(root->reference(), 4, 100);
   EXPECT_EQ(heard, 104);
   EXPECT_EQ(MAIDDataHandler(root->reference(), nullptr, nullptr), 5);
-
-  void* const gone = root->reference();
-  root.reset();
-  MAIDEventHandler(gone, 5, 100);
-  EXPECT_EQ(heard, 104);
-  EXPECT_EQ(MAIDDataHandler(gone, nullptr, nullptr), 0);
-  MAIDEventHandler(nullptr, 5, 0);
-  EXPECT_EQ(MAIDDataHandler(nullptr, nullptr, nullptr), 0);
-}
-
-TEST_F(Callbacks, ThatNobodyHandlesAreTraced) {
-  const CNikonObject* const camera = root->openChild(1, "camera");
-  auto* const reference = const_cast<CNikonCallbackReceiver*>(static_cast<const CNikonCallbackReceiver*>(camera));
-  MAIDEventHandler(reference, 2, 0);
-  EXPECT_EQ(recorder.traced("Event Notification: kNkMAIDEvent_WarmingUp"), 1U);
-  EXPECT_EQ(recorder.traced("Unhandled event: kNkMAIDEvent_WarmingUp"), 1U);
-  EXPECT_EQ(MAIDDataHandler(reference, nullptr, nullptr), 0);
-  EXPECT_EQ(recorder.traced("Unhandled data callback"), 1U);
-}
-
-TEST_F(Callbacks, NothingIsThrownIntoTheSdk) {
   root->onEvent = [](std::int32_t, void*) { throw std::int32_t{-116}; };
   root->onData = [](void*, void*) -> std::int32_t { throw std::runtime_error("broken"); };
   EXPECT_NO_THROW(MAIDEventHandler(root->reference(), 0, 0));
   EXPECT_EQ(MAIDDataHandler(root->reference(), nullptr, nullptr), 0);
   EXPECT_EQ(recorder.logged("MAIDEventHandler: -116"), 1U);
   EXPECT_EQ(recorder.logged("MAIDDataHandler: broken"), 1U);
+
+  const CNikonObject* const camera = root->openChild(1, "camera");
+  auto* const plain = const_cast<CNikonCallbackReceiver*>(static_cast<const CNikonCallbackReceiver*>(camera));
+  MAIDEventHandler(plain, 2, 0);
+  EXPECT_EQ(recorder.traced("Unhandled event: kNkMAIDEvent_WarmingUp"), 1U);
+  EXPECT_EQ(MAIDDataHandler(plain, nullptr, nullptr), 0);
+  EXPECT_EQ(recorder.traced("Unhandled data callback"), 1U);
+
+  void* const gone = root->reference();
+  root.reset();
+  for (void* const reference : {gone, static_cast<void*>(nullptr)}) {
+    MAIDEventHandler(reference, 5, 100);
+    EXPECT_EQ(MAIDDataHandler(reference, nullptr, nullptr), 0);
+  }
+  EXPECT_EQ(recorder.traced("Event Notification: "), 1U);
 }
 
 TEST_F(Callbacks, AnEventDuringTheOpenWaitsUntilTheObjectIsWhole) {

@@ -40,25 +40,33 @@ class Capabilities : public ::testing::Test {
 };
 
 TEST_F(Capabilities, EveryValueTypeBecomesItsTableElement) {
-  set(Capability::boolean(kSomething, true));
-  EXPECT_EQ(asText(), "1");
-  set(Capability::integer(kSomething, -5));
-  EXPECT_EQ(asText(), "-5");
-  set(Capability::unsignedInteger(kSomething, 0xFFFFFFFFU));
-  EXPECT_EQ(asText(), "-1") << "values are signed 32-bit numbers";
-  set(Capability::string(kSomething, "text"));
-  EXPECT_EQ(asText(), "text");
-  set(Capability::integers(kSomething, {10, -20, 30}, 1));
-  EXPECT_EQ(asText(), "-20");
-  set(Capability::unsigneds(kSomething, {10, 20, 30}, 2));
-  EXPECT_EQ(asText(), "30");
-  set(Capability::packedStrings(kSomething, {"A", "BB", "CCC"}, 2));
-  EXPECT_EQ(asText(), "CCC");
-  set(Capability::strings(kSomething, {"A", "BB"}, 1));
-  EXPECT_EQ(asText(), "BB");
+  const std::vector<std::pair<Capability, std::string>> table{
+      {Capability::boolean(kSomething, true), "1"},
+      {Capability::integer(kSomething, -5), "-5"},
+      {Capability::unsignedInteger(kSomething, 0xFFFFFFFFU), "-1"},  // values are signed 32-bit numbers
+      {Capability::string(kSomething, "text"), "text"},
+      {Capability::integers(kSomething, {10, -20, 30}, 1), "-20"},
+      {Capability::unsigneds(kSomething, {10, 20, 30}, 2), "30"},
+      {Capability::packedStrings(kSomething, {"A", "BB", "CCC"}, 2), "CCC"},
+      {Capability::strings(kSomething, {"A", "BB"}, 1), "BB"},
+      // Without elements.
+      {Capability::unsigneds(kSomething, {}), "0"},
+      {Capability::packedStrings(kSomething, {}), ""},
+      {Capability::strings(kSomething, {}), ""},
+      // An index beyond the end.
+      {Capability::unsigneds(kSomething, {1, 2, 3}, 3), "null"},
+      {Capability::packedStrings(kSomething, {"A", "BB", "CCC"}, 3), "null"},
+      {Capability::strings(kSomething, {"A"}, 0x10000000), "null"}};
+  for (const auto& [capability, text] : table) {
+    set(capability);
+    EXPECT_EQ(asText(), text);
+  }
+  EXPECT_EQ(recorder.traced("enum had no elements for parameter: 33280"), 1U);
+  EXPECT_EQ(recorder.traced("Ran out of space in packed string while attempting to get enum value for parameter 33280"),
+            1U);
 }
 
-TEST_F(Capabilities, WhatIsNotAnnouncedOrOfAnUnknownTypeIsNull) {
+TEST_F(Capabilities, WhatIsNotAnnouncedOrOfAnUnknownTypeOrFailsIsNotRead) {
   EXPECT_EQ(object().getCapabilityAsTE(kSomething), nullptr);
   std::int32_t number = 77;
   std::string text = "kept";
@@ -69,38 +77,20 @@ TEST_F(Capabilities, WhatIsNotAnnouncedOrOfAnUnknownTypeIsNull) {
 
   set(Capability::ofValueType(kSomething, 4));
   EXPECT_EQ(asText(), "null");
-  EXPECT_EQ(recorder.traced("Unhandled parameter type for parameter kNkMAIDCapability_MovieRec") +
-                recorder.traced("Unhandled parameter type for parameter "),
-            1U);
+  EXPECT_EQ(recorder.traced("Unhandled parameter type for parameter "), 1U);
   EXPECT_EQ(recorder.traced("Parameter type was 4"), 1U);
   EXPECT_EQ(object().getIntCapability(kSomething, number), -1);
+  EXPECT_EQ(number, 77);
+
+  set(Capability::unsignedInteger(kSomething, 5));
+  model.faults().add({.parameter = kSomething, .times = 1, .answer = kNkMAIDResult_DeviceBusy});
+  EXPECT_EQ(object().getIntCapability(kSomething, number), kNkMAIDResult_DeviceBusy);
   EXPECT_EQ(number, 77);
 
   set(Capability::unsigneds(kSomething, {1}));
   model.faults().add({.parameter = kSomething, .editEnum = [](tagNkMAIDEnum& record) { record.elementType = 3; }});
   EXPECT_EQ(asText(), "null");
   EXPECT_EQ(recorder.traced("enum type was 3"), 1U);
-}
-
-TEST_F(Capabilities, AnEnumerationWithoutElementsReadsAsNothingAndSucceeds) {
-  set(Capability::unsigneds(kSomething, {}));
-  EXPECT_EQ(asText(), "0");
-  EXPECT_EQ(recorder.traced("enum had no elements for parameter: 33280"), 1U);
-  set(Capability::packedStrings(kSomething, {}));
-  EXPECT_EQ(asText(), "");
-  set(Capability::strings(kSomething, {}));
-  EXPECT_EQ(asText(), "");
-}
-
-TEST_F(Capabilities, AnIndexBeyondTheEndIsNoValue) {
-  for (const auto& capability :
-       {Capability::unsigneds(kSomething, {1, 2, 3}, 3), Capability::packedStrings(kSomething, {"A", "BB", "CCC"}, 3),
-        Capability::strings(kSomething, {"A"}, 0x10000000)}) {
-    set(capability);
-    EXPECT_EQ(asText(), "null");
-  }
-  EXPECT_EQ(recorder.traced("Ran out of space in packed string while attempting to get enum value for parameter 33280"),
-            1U);
 }
 
 TEST_F(Capabilities, EnumerationsThatLieAreNotBelieved) {
@@ -136,16 +126,6 @@ TEST_F(Capabilities, StringsWithoutAnEndStopAtTheirBuffersEnd) {
   EXPECT_EQ(asText(), std::string(256, 'X'));
 }
 
-TEST_F(Capabilities, AFailedReadPassesItsResultOnAndKeepsTheOutArgument) {
-  set(Capability::unsignedInteger(kSomething, 5));
-  std::int32_t number = 77;
-  model.faults().add({.parameter = kSomething, .times = 1, .answer = kNkMAIDResult_DeviceBusy});
-  EXPECT_EQ(object().getIntCapability(kSomething, number), kNkMAIDResult_DeviceBusy);
-  EXPECT_EQ(number, 77);
-  EXPECT_EQ(object().getIntCapability(kSomething, number), 0);
-  EXPECT_EQ(number, 5);
-}
-
 TEST_F(Capabilities, AListThatChangesWhileItIsReadIsReadAgain) {
   model.faults().add(
       {.level = Level::Camera, .command = kNkMAIDCommand_GetCapInfo, .times = 1, .answer = kNkMAIDResult_BufferSize});
@@ -167,7 +147,7 @@ TEST_F(Capabilities, AListThatCannotBeReadLeavesAnObjectThatAnnouncesNothing) {
   EXPECT_EQ(recorder.traced("Error from kNkMAIDCommand_GetCapInfo: "), 4U);
 }
 
-TEST_F(Capabilities, AnActionIsWaitedForByPollingAndCompletesInsideTheCall) {
+TEST_F(Capabilities, AnActionIsWaitedForByPollingUntilItsCompletionOrAFailedPoll) {
   SpyObject module(Model::entryPoint());
   auto* const spy = new SpyObject(&module, 1);
   int completions = 0;
@@ -177,23 +157,18 @@ TEST_F(Capabilities, AnActionIsWaitedForByPollingAndCompletesInsideTheCall) {
   EXPECT_EQ(spy->issueCommand(kSomething, spy, nullptr), 0) << "not announced: nothing is done";
   EXPECT_EQ(spy->capStart(kNkMAIDCapability_Capture, nullptr, nullptr), kNkMAIDResult_Pending);
   EXPECT_EQ(completions, 1) << "without a receiver nothing is waited for";
-}
+  while (camera.items().size() < 2) EXPECT_TRUE(spy->async());
+  EXPECT_TRUE(spy->async());
 
-TEST_F(Capabilities, AStartThatFailedAndAPollThatFailsEndTheWait) {
-  SpyObject module(Model::entryPoint());
-  auto* const spy = new SpyObject(&module, 1);
-  int completions = 0;
-  spy->onCompletion = [&](std::int32_t, std::int32_t, void*) { ++completions; };
   const auto start = model.faults().add({.command = kNkMAIDCommand_CapStart, .answer = kNkMAIDResult_OutOfFocus});
   EXPECT_EQ(spy->issueCommand(kNkMAIDCapability_Capture, spy, nullptr), kNkMAIDResult_OutOfFocus);
   model.faults().remove(start);
-
   // The completion comes later than the wait for it: it finds nothing any more.
   model.faults().add(
       {.level = Level::Camera, .command = kNkMAIDCommand_Async, .times = 1, .answer = kNkMAIDResult_HardwareError});
   EXPECT_EQ(spy->issueCommand(kNkMAIDCapability_Capture, spy, nullptr), 0);
   for (int poll = 0; poll < 5; ++poll) EXPECT_TRUE(spy->async());
-  EXPECT_EQ(completions, 0);
+  EXPECT_EQ(completions, 1);
 }
 
 }  // namespace

@@ -101,11 +101,6 @@ TEST_F(DownloadThreadTest, AnItemIsDeletedWithItsWrapperAndAWrapperEmptiedWithIt
   loop->perform([&] { downloads.addToDownloadQueue(wrapper); });  // skipped
 }
 
-TEST_F(DownloadThreadTest, EndsSoonAfterItIsCancelled) {
-  thread->cancel();
-  thread->join();
-}
-
 TEST_F(ServiceTest, ItemsAreTransferredInTheOrderOfTheirQueueing) {
   auto& camera = model.addCamera(1, "One");
   camera.setTransfer({.deliveryBytes = 100});
@@ -120,12 +115,17 @@ TEST_F(ServiceTest, ItemsAreTransferredInTheOrderOfTheirQueueing) {
   }
   EXPECT_TRUE(std::is_sorted(sizes.begin(), sizes.end()));
   EXPECT_EQ(order.find("oo"), std::string::npos) << "a file began before the one before it was complete";
+  EXPECT_NE(recorder.await("objectWasAdded").thread, std::this_thread::get_id());
 }
 
-TEST_F(ServiceTest, ACameraThatGoesWithItemsQueuedAndOneInTransferLeavesNothingBehind) {
+TEST_F(ServiceTest, ACameraThatGoesWithItemsQueuedAndOneThatNeverCompletesLeavesNothingBehind) {
   auto& camera = model.addCamera(1, "One");
   model.addCamera(2, "Two");
   camera.setTransfer({.deliveryBytes = 10, .bytesPerSecond = 1000});
+  model.faults().add(
+      {.level = Level::Data, .camera = 2, .command = kNkMAIDCommand_CapStart, .times = 1, .noCompletion = true});
+  model.faults().add(
+      {.level = Level::Data, .camera = 2, .command = kNkMAIDCommand_Async, .answer = 0, .doAnyway = true});
   start();
   for (int shot = 0; shot < 10; ++shot) camera.shoot(Picture::jpeg(bytes(100000)));
   idleUntil("objectWasAdded");
@@ -134,32 +134,30 @@ TEST_F(ServiceTest, ACameraThatGoesWithItemsQueuedAndOneInTransferLeavesNothingB
   idle();
   EXPECT_EQ(model.openObjects(), 2U) << "the module and camera 2";
   model.camera(2)->shoot(Picture::jpeg(bytes(7)));
-  const Message complete = idleUntil("fileDownloadComplete");
-  EXPECT_EQ(complete.numbers.at("capture_id"), recorder.await("objectWasAdded", 2).numbers.at("capture_id"));
-}
-
-TEST_F(ServiceTest, ATransferThatNeverCompletesIsGivenUpWithItsCamera) {
-  auto& camera = model.addCamera(1, "One");
-  model.faults().add({.level = Level::Data, .command = kNkMAIDCommand_CapStart, .noCompletion = true});
-  model.faults().add({.level = Level::Data, .command = kNkMAIDCommand_Async, .answer = 0, .doAnyway = true});
-  start();
-  camera.shoot(Picture::jpeg(bytes(100)));
-  idleUntil("objectWasAdded");
-  model.removeCamera(1);
-  idleUntil("deviceRemoved");
+  idleUntil("objectWasAdded", 2);
+  model.removeCamera(2);
+  idleUntil("deviceRemoved", 2);
   idle();
   EXPECT_EQ(model.openObjects(), 1U);
+  model.addCamera(1, "One").shoot(Picture::jpeg(bytes(7)));
+  const Message complete = idleUntil("fileDownloadComplete");
+  EXPECT_EQ(complete.numbers.at("capture_id"), recorder.await("objectWasAdded", 3).numbers.at("capture_id"));
 }
 
-TEST_F(ServiceTest, DeliveriesOnTheMainThreadAreHandledThere) {
+// In polls of the main thread, and from a thread of the module.
+TEST_F(ServiceTest, DeliveriesArriveWholeWhicheverThreadBringsThem) {
   auto& camera = model.addCamera(1, "One");
   camera.setTransfer({.deliveryBytes = 10, .inModulePolls = true});
   start();
-  for (int shot = 0; shot < 20; ++shot) camera.shoot(Picture::jpeg(bytes(995, shot)));
-  idleUntil("fileDownloadComplete", 20);
-  for (std::size_t n = 1; n <= 20; ++n) {
-    EXPECT_EQ(read(recorder.await("fileDownloadComplete", n).strings.at("file_path")),
-              bytes(995, static_cast<int>(n) - 1));
+  for (int shot = 1; shot <= 40; ++shot) {
+    camera.shoot(Picture::jpeg(bytes(995, shot)));
+    if (shot == 20) idleUntil("fileDownloadComplete", 20);
+    if (shot == 20) model.faults().add({.level = Level::Data, .command = kNkMAIDCommand_CapStart, .ownThread = true});
+  }
+  idleUntil("fileDownloadComplete", 40);
+  for (std::size_t n = 1; n <= 40; ++n) {
+    const Message complete = recorder.await("fileDownloadComplete", n);
+    EXPECT_EQ(read(complete.strings.at("file_path")), bytes(995, static_cast<int>(n)));
   }
 }
 
