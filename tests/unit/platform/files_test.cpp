@@ -1,6 +1,5 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -53,7 +52,7 @@ TEST(FileHandle, ABackgroundReadReportsWhatThereIsAndThenTheEnd) {
   EXPECT_EQ(chunks, (std::vector<std::string>{"one", "two", ""}));
 }
 
-TEST(FileHandle, WritesFromTwoThreadsStayWholeAlsoThroughAFullNonBlockingPipe) {
+TEST(FileHandle, WritesFromTwoThreadsStayWholeThroughAFullNonBlockingPipeAndFailWhenItIsClosed) {
   Pipe pipe;
   fcntl(pipe.writing->descriptor(), F_SETFL, O_NONBLOCK);
   constexpr std::size_t kLength = 200000;
@@ -73,26 +72,26 @@ TEST(FileHandle, WritesFromTwoThreadsStayWholeAlsoThroughAFullNonBlockingPipe) {
   first.join();
   second.join();
   EXPECT_EQ(got.find_first_not_of(got.front()), kLength);
-}
-
-TEST(FileHandle, AWriteToAClosedPipeReportsItsError) {
   std::signal(SIGPIPE, SIG_IGN);
-  Pipe pipe;
   pipe.reading.reset();
   EXPECT_EQ(pipe.writing->write("x", 1), EPIPE);
 }
 
 TEST(Paths, AreTakenApartAndJoined) {
   using namespace platform;
-  EXPECT_EQ(deletingLastPathComponent("/a/b.c"), "/a");
-  EXPECT_EQ(deletingLastPathComponent("/b"), "/");
-  EXPECT_EQ(deletingLastPathComponent("b"), "");
-  EXPECT_EQ(lastPathComponent("/a.d/b"), "b");
-  EXPECT_EQ(pathExtension("/a.d/b"), "");
-  EXPECT_EQ(pathExtension("x.tar.gz"), "gz");
-  EXPECT_EQ(pathExtension("/a/.hidden"), "");
-  EXPECT_EQ(deletingPathExtension("x.tar.gz"), "x.tar");
-  EXPECT_EQ(deletingPathExtension("/a.d/b"), "/a.d/b");
+  const struct {
+    std::string path, folder, name, extension, without;
+  } table[] = {{"/a/b.c", "/a", "b.c", "c", "/a/b"},
+               {"/b", "/", "b", "", "/b"},
+               {"x.tar.gz", "", "x.tar.gz", "gz", "x.tar"},
+               {"/a.d/b", "/a.d", "b", "", "/a.d/b"},
+               {"/a/.hidden", "/a", ".hidden", "", "/a/.hidden"}};
+  for (const auto& row : table) {
+    EXPECT_EQ(deletingLastPathComponent(row.path), row.folder);
+    EXPECT_EQ(lastPathComponent(row.path), row.name);
+    EXPECT_EQ(pathExtension(row.path), row.extension);
+    EXPECT_EQ(deletingPathExtension(row.path), row.without);
+  }
   EXPECT_EQ(appendingPathComponent("/", "b"), "/b");
   EXPECT_EQ(appendingPathComponent("/a/", "b"), "/a/b");
   EXPECT_EQ(appendingPathComponent("", "b"), "b");
@@ -100,21 +99,22 @@ TEST(Paths, AreTakenApartAndJoined) {
 
 class InFolder : public ::testing::Test {
  protected:
-  InFolder() {
-    std::string pattern = ::testing::TempDir() + "tether-platform-XXXXXX";
-    folder = mkdtemp(pattern.data());
-  }
   ~InFolder() override { std::filesystem::remove_all(folder); }
-  std::string folder;
+  std::string pattern = ::testing::TempDir() + "tether-platform-XXXXXX";
+  std::string folder = mkdtemp(pattern.data());
 };
 
-TEST_F(InFolder, ADanglingLinkCountsAsSomethingThere) {
+TEST_F(InFolder, ADanglingLinkIsSomethingAndATemporaryDirectoryThatIsNotThereIsNone) {
   const std::string link = folder + "/link";
   ASSERT_EQ(symlink("/nowhere/at/all", link.c_str()), 0);
   EXPECT_TRUE(FileManager::exists(link));
   EXPECT_TRUE(FileManager::remove(link));
   EXPECT_FALSE(FileManager::exists(link));
   EXPECT_FALSE(FileManager::remove(link));
+  setenv("TMPDIR", (folder + "/").c_str(), 1);
+  EXPECT_EQ(platform::temporaryDirectory(), folder);
+  setenv("TMPDIR", (folder + "/missing").c_str(), 1);
+  EXPECT_TRUE(FileManager::isDirectory(platform::temporaryDirectory()));
 }
 
 TEST_F(InFolder, RoomIsKeptWithoutChangingTheSizeAndItsLackIsTold) {
@@ -137,13 +137,6 @@ TEST(MemoryBlock, IsZeroAndMoves) {
   EXPECT_EQ(MemoryBlock(SIZE_MAX / 2).data(), nullptr);
 }
 
-TEST_F(InFolder, TheTemporaryDirectoryIsTheNamedOneWhereThereIsOne) {
-  setenv("TMPDIR", (folder + "/").c_str(), 1);
-  EXPECT_EQ(platform::temporaryDirectory(), folder);
-  setenv("TMPDIR", (folder + "/missing").c_str(), 1);
-  EXPECT_TRUE(FileManager::isDirectory(platform::temporaryDirectory()));
-}
-
 TEST_F(InFolder, ABundleNeedsAFolderWithAnExecutableThatLoads) {
   using platform::Bundle;
   EXPECT_EQ(Bundle::create(folder + "/Missing.bundle"), nullptr);
@@ -155,10 +148,8 @@ TEST_F(InFolder, ABundleNeedsAFolderWithAnExecutableThatLoads) {
   ASSERT_NE(broken, nullptr);
   EXPECT_FALSE(broken->loadExecutable());
   EXPECT_EQ(broken->functionPointer("MAIDEntryPoint"), nullptr);
-}
-
-TEST(Bundle, AnExecutableOutsideABundleHasItsOwnFolderAsMainBundle) {
-  EXPECT_EQ(platform::Bundle::mainBundlePath(), std::filesystem::canonical("/proc/self/exe").parent_path().string());
+  // An executable outside a bundle has its own folder as main bundle.
+  EXPECT_EQ(Bundle::mainBundlePath(), std::filesystem::canonical("/proc/self/exe").parent_path().string());
 }
 
 }  // namespace

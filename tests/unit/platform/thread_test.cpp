@@ -94,12 +94,10 @@ TEST(Notifications, RemovingOnAnotherThreadWaitsForTheDeliveryInProgress) {
 TEST(Log, ASinkGetsTheTextCutToTheLongestLine) {
   std::string line;
   platform::setLogSink([&](const std::string& text) { line = text; });
-  platform::log("%s %d", "number", 5);
-  EXPECT_EQ(line, "number 5");
-  platform::log("%s", std::string(10000, 'x').c_str());
-  EXPECT_GT(line.size(), 3000U);
-  EXPECT_LT(line.size(), 4096U);
+  platform::log("%s %s", "text", std::string(10000, 'x').c_str());
   platform::setLogSink(nullptr);
+  EXPECT_EQ(line.substr(0, 6), "text x");
+  EXPECT_TRUE(line.size() > 3000 && line.size() < 4096) << line.size();
 }
 
 }  // namespace

@@ -1,11 +1,8 @@
 #include <gtest/gtest.h>
-#include <stdlib.h>
 #include <unistd.h>
 
 #include <filesystem>
 #include <fstream>
-#include <string>
-#include <vector>
 
 #include "DebugTrace.h"
 #include "DeferredCalls.h"
@@ -21,81 +18,46 @@ using platform::RunLoop;
 void count(void* counter) { ++*static_cast<int*>(counter); }
 void countToo(void* counter) { *static_cast<int*>(counter) += 100; }
 
-void turnUntilNothingIsQueued() {
-  while (CallDelay::queuedCount() > 0) RunLoop::current()->runOnce(Clock::now() + 1s);
-}
-
 TEST(DeferredCalls, ANewerRequestForTheSamePairCancelsTheOlderAndRestartsTheWait) {
   int calls = 0;
+  int others = 0;
   CallAfterDelay(count, &calls, 0.02);
   CallAfterDelay(count, &calls, 0.05);
+  CallAfterDelay(countToo, &calls, 0);
+  CallAfterDelay(count, &others, 0);
+  CallAfterDelay(countToo, &others, 0);
+  CallDelay::cancelCallsToProc(countToo, &others);
+  CallDelay::cancelCallsToProc(countToo, nullptr);
   EXPECT_EQ(calls, 0);
-  EXPECT_EQ(CallDelay::queuedCount(), 2U);
-  while (CallDelay::queuedCount() == 2) RunLoop::current()->runOnce(Clock::now() + 1s);
-  EXPECT_EQ(calls, 0) << "the cancelled request woke up and did something";
-  turnUntilNothingIsQueued();
-  EXPECT_EQ(calls, 1);
-}
-
-TEST(DeferredCalls, OtherArgumentsAndOtherFunctionsAreOtherPairs) {
-  int first = 0;
-  int second = 0;
-  CallAfterDelay(count, &first, 0);
-  CallAfterDelay(count, &second, 0);
-  CallAfterDelay(countToo, &first, 0);
-  turnUntilNothingIsQueued();
-  EXPECT_EQ(first, 101);
-  EXPECT_EQ(second, 1);
-}
-
-TEST(DeferredCalls, CancellingKeepsACallFromReachingWhatHasGone) {
-  CallDelay::cancelCallsToProc(count, nullptr);
-  int calls = 0;
-  CallAfterDelay(count, &calls, 0);
-  CallDelay::cancelCallsToProc(count, &calls);
-  turnUntilNothingIsQueued();
-  EXPECT_EQ(calls, 0);
+  while (CallDelay::queuedCount() > 1) RunLoop::current()->runOnce(Clock::now() + 1s);
+  EXPECT_EQ(calls, 100) << "the cancelled request woke up and did something";
+  EXPECT_EQ(others, 1) << "another argument or function is another pair";
+  while (CallDelay::queuedCount() > 0) RunLoop::current()->runOnce(Clock::now() + 1s);
+  EXPECT_EQ(calls, 101);
+  EXPECT_EQ(others, 1);
 }
 
 TEST(DeferredCalls, TheClockCountsSecondsFromTheYear2001) {
-  const double now = currentTime();
-  EXPECT_GT(now, 24 * 365 * 86400.0);
-  EXPECT_LT(now, 200 * 365 * 86400.0);
+  EXPECT_GT(currentTime(), 24 * 365 * 86400.0);
+  EXPECT_LT(currentTime(), 200 * 365 * 86400.0);
 }
 
-class UniqueFilePath : public ::testing::Test {
- protected:
-  UniqueFilePath() {
-    std::string pattern = ::testing::TempDir() + "tether-unique-XXXXXX";
-    folder = mkdtemp(pattern.data());
-  }
-  ~UniqueFilePath() override { std::filesystem::remove_all(folder); }
-  void touch(const std::string& name) const { std::ofstream(folder + "/" + name).put('x'); }
-  std::string uniqueName(const std::string& name) const {
-    const std::string path = MakeUniqueFilePath(folder, name);
-    EXPECT_EQ(path.substr(0, folder.size() + 1), folder + "/");
-    return path.substr(folder.size() + 1);
-  }
-  std::string folder;
-};
-
-TEST_F(UniqueFilePath, NumbersFromTwoBeforeTheExtension) {
-  EXPECT_EQ(uniqueName("a.jpg"), "a.jpg");
-  touch("a.jpg");
-  EXPECT_EQ(uniqueName("a.jpg"), "a-2.jpg");
-  touch("a-2.jpg");
-  EXPECT_EQ(uniqueName("a.jpg"), "a-3.jpg");
-  touch("notes");
-  EXPECT_EQ(uniqueName("notes"), "notes-2");
-  touch("x.tar.gz");
-  EXPECT_EQ(uniqueName("x.tar.gz"), "x.tar-2.gz");
-}
-
-TEST_F(UniqueFilePath, WhateverHasTheNameTakesIt) {
-  std::filesystem::create_directory(folder + "/Capture0005.nef");
-  EXPECT_EQ(uniqueName("Capture0005.nef"), "Capture0005-2.nef");
-  std::filesystem::create_symlink("/nowhere", folder + "/Capture0006.nef");
-  EXPECT_EQ(uniqueName("Capture0006.nef"), "Capture0006-2.nef");
+TEST(UniqueFilePath, NumbersFromTwoBeforeTheExtensionWhateverHasTheName) {
+  std::string pattern = ::testing::TempDir() + "tether-unique-XXXXXX";
+  const std::string folder = mkdtemp(pattern.data());
+  const auto expect = [&](const std::string& name, const std::string& unique) {
+    EXPECT_EQ(MakeUniqueFilePath(folder, name), folder + "/" + unique);
+  };
+  expect("a.jpg", "a.jpg");
+  for (const char* name : {"a.jpg", "a-2.jpg", "notes", "x.tar.gz"}) std::ofstream(folder + "/" + name).put('x');
+  std::filesystem::create_directory(folder + "/folder.nef");
+  std::filesystem::create_symlink("/nowhere", folder + "/link.nef");
+  expect("a.jpg", "a-3.jpg");
+  expect("notes", "notes-2");
+  expect("x.tar.gz", "x.tar-2.gz");
+  expect("folder.nef", "folder-2.nef");
+  expect("link.nef", "link-2.nef");
+  std::filesystem::remove_all(folder);
 }
 
 TEST(DebugTrace, LinesAreFormattedCutAndDroppedWithoutASink) {
