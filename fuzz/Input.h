@@ -1,13 +1,23 @@
-// The bytes of one run, taken from the front. Where there are none left, everything that is drawn is 0.
+// What the targets share: the rules they check, and the bytes of a run as numbers.
 #pragma once
 
 #include <algorithm>
 #include <cstddef>
 #include <cstdint>
+#include <cstdio>
+#include <cstdlib>
 #include <cstring>
 
 namespace fuzz {
 
+// A rule that holds for every input. One that does not ends the program, which is a finding.
+inline void check(bool holds, const char* rule) {
+  if (holds) return;
+  std::fprintf(stderr, "Broken rule: %s\n", rule);
+  std::abort();
+}
+
+// The bytes of one run, taken from the front. Where there are none left, everything that is drawn is 0.
 class Input {
  public:
   Input(const uint8_t* bytes, std::size_t count) : _bytes(bytes), _left(count) {}

@@ -3,7 +3,7 @@
 #include <memory>
 #include <string>
 
-#include "Check.h"
+#include "Input.h"
 #include "KtLuaTableMarshalling.h"
 #include "KtNSDataStreamBuf.h"
 

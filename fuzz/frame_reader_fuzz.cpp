@@ -9,7 +9,7 @@
 #include <string>
 #include <vector>
 
-#include "Check.h"
+#include "Input.h"
 #include "KtNSDataStreamBuf.h"
 #include "KtRCMessageAccumulator.h"
 #include "Log.h"

@@ -11,7 +11,6 @@
 #include <mutex>
 #include <string>
 
-#include "Check.h"
 #include "ContentContainer.h"
 #include "ContentData.h"
 #include "FuzzedModule.h"
@@ -163,6 +162,15 @@ void SendMessageToClient(long /*id*/, const char* name, KtLuaTETable* data) {
   KtLuaTE* const path = data->elementForKey("file_path");
   check(path != nullptr, "what is complete has a path");
   check(fs::file_size(static_cast<std::string>(*path)) == size, "what is complete has its size");
+}
+
+// A camera may announce a file of 4 GiB. There need not be memory for it, but there must be an answer.
+#define OPTIONS "allocator_may_return_null=1:max_allocation_size_mb=256"
+extern "C" {
+[[gnu::visibility("default")]] const char* __asan_default_options();
+[[gnu::visibility("default")]] const char* __tsan_default_options();
+const char* __asan_default_options() { return OPTIONS; }
+const char* __tsan_default_options() { return OPTIONS; }
 }
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* bytes, size_t count) {
