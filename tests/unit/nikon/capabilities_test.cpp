@@ -117,25 +117,22 @@ TEST_F(Capabilities, EnumerationsThatLieAreNotBelieved) {
 }
 
 TEST_F(Capabilities, StringsWithoutAnEndStopAtTheirBuffersEnd) {
-  set(Capability::string(kSomething, "text"));
   model.faults().add({.parameter = kSomething, .unterminated = true});
-  EXPECT_EQ(asText(), std::string(256, 'X'));
-  set(Capability::packedStrings(kSomething, {"A", "BB"}));
-  EXPECT_EQ(asText(), "XXXXX");
-  set(Capability::strings(kSomething, {"A", "BB"}, 1));
-  EXPECT_EQ(asText(), std::string(256, 'X'));
+  for (const auto& [capability, length] : {std::pair(Capability::string(kSomething, "text"), 256),
+                                           std::pair(Capability::packedStrings(kSomething, {"A", "BB"}), 5),
+                                           std::pair(Capability::strings(kSomething, {"A", "BB"}, 1), 256)}) {
+    set(capability);
+    EXPECT_EQ(asText(), std::string(static_cast<std::size_t>(length), 'X'));
+  }
 }
 
-TEST_F(Capabilities, AListThatChangesWhileItIsReadIsReadAgain) {
+TEST_F(Capabilities, AListThatChangesIsReadAgainAndOneThatCannotBeReadAnnouncesNothing) {
   model.faults().add(
       {.level = Level::Camera, .command = kNkMAIDCommand_GetCapInfo, .times = 1, .answer = kNkMAIDResult_BufferSize});
   EXPECT_TRUE(object().hasCapability(kNkMAIDCapability_Name));
   EXPECT_EQ(recorder.traced("Error from kNkMAIDCommand_GetCapInfo"), 0U);
   object().debugDumpCapabilities();
   EXPECT_EQ(recorder.traced("\t9\tkNkMAIDCapability_Name\t8"), 1U);
-}
-
-TEST_F(Capabilities, AListThatCannotBeReadLeavesAnObjectThatAnnouncesNothing) {
   for (const std::uint32_t command : {kNkMAIDCommand_GetCapCount, kNkMAIDCommand_GetCapInfo}) {
     for (const std::int32_t result : {kNkMAIDResult_HardwareError, kNkMAIDResult_BufferSize}) {
       root.reset();

@@ -52,7 +52,6 @@ TEST_F(ObjectTree, AFailedOpenReportsTheSdkResultAndLeavesNothing) {
   root = std::make_unique<CNikonObject>(Model::entryPoint(), "module");
   EXPECT_EQ(root->openChild(5, "camera"), nullptr);
   EXPECT_EQ(recorder.traced("Error opening child: "), 1U);
-
   model.failCall(1, kNkMAIDResult_MissingComponent);
   EXPECT_EQ(InitializeNikonModule(Model::entryPoint(), "module"), kNkMAIDResult_MissingComponent);
   EXPECT_EQ(recorder.traced("Error from Command_Open: kNkMAIDResult_MissingComponent"), 1U);
@@ -64,18 +63,15 @@ TEST_F(ObjectTree, AClosedObjectSendsNothingAndIsNoParent) {
   openAll();
   CNikonObject* const camera = root->openChild(1, "camera");
   camera->closeNikonObject();
-  EXPECT_FALSE(camera->checkObject());
   model.record(true);
   camera->closeNikonObject();
   std::vector<std::int32_t> ids{1, 2};
   std::int32_t number = 0;
-  std::string text;
   EXPECT_EQ(camera->enumChildren(), -1);
   EXPECT_EQ(camera->listChildren(ids), -1);
   EXPECT_EQ(camera->getIntCapability(kNkMAIDCapability_BatteryLevel, number), -1);
-  EXPECT_EQ(camera->getStringCapability(kNkMAIDCapability_Name, text), -1);
   EXPECT_EQ(camera->capStart(kNkMAIDCapability_Capture, nullptr, nullptr), -1);
-  EXPECT_FALSE(camera->async());
+  EXPECT_FALSE(camera->async() || camera->checkObject());
   EXPECT_EQ(camera->openChild(2, "item"), nullptr);
   EXPECT_TRUE(ids.empty());
   EXPECT_TRUE(model.calls().empty());
@@ -83,22 +79,15 @@ TEST_F(ObjectTree, AClosedObjectSendsNothingAndIsNoParent) {
 
 TEST_F(ObjectTree, ChildrenAreListedInTheOrderOfTheSdkAndFailuresEmptyTheList) {
   openAll();
-  model.faults().add({.level = Level::Module, .times = 2, .children = {{7, 2, 5}}});
   std::vector<std::int32_t> ids;
+  model.faults().add({.level = Level::Module, .times = 2, .children = {{7, 2, 5}}});
   EXPECT_EQ(root->listChildren(ids), 0);
   EXPECT_EQ(ids, (std::vector<std::int32_t>{7, 2, 5}));
-  EXPECT_EQ(root->listChildren(ids), 0);
-  EXPECT_EQ(ids, (std::vector<std::int32_t>{1, 2}));
-  EXPECT_EQ(recorder.traced("Children found:"), 2U);
-  EXPECT_EQ(recorder.traced("\t ID: 2"), 2U);
-
-  model.faults().add({.level = Level::Module,
-                      .command = kNkMAIDCommand_CapGetArray,
-                      .times = 1,
-                      .answer = kNkMAIDResult_HardwareError});
-  EXPECT_EQ(root->listChildren(ids), kNkMAIDResult_HardwareError);
+  model.faults().add(
+      {.level = Level::Module, .command = kNkMAIDCommand_CapGetArray, .answer = kNkMAIDResult_DeviceBusy});
+  EXPECT_EQ(root->listChildren(ids), kNkMAIDResult_DeviceBusy);
   EXPECT_TRUE(ids.empty());
-  EXPECT_EQ(recorder.traced("Error detected: (-116) kNkMAIDResult_HardwareError"), 1U);
+  EXPECT_EQ(recorder.traced("Error detected: (152) kNkMAIDResult_DeviceBusy"), 1U);
 }
 
 TEST_F(ObjectTree, ADeletionWaitsForAnotherThreadsAndSaysSoEveryThirtySeconds) {
@@ -118,10 +107,6 @@ TEST_F(ObjectTree, ADeletionWaitsForAnotherThreadsAndSaysSoEveryThirtySeconds) {
   release.set_value();
   deleter.get();
   EXPECT_EQ(model.openObjects(), 0U);
-}
-
-TEST(ObjectTreeDeathTest, AChildWithoutAParentIsAProgrammingError) {
-  EXPECT_DEATH(CNikonObject(nullptr, 1, "child"), "Assertion failed: \\(parentObject != NULL\\)");
 }
 
 }  // namespace
