@@ -1,4 +1,4 @@
-// Several modules, and broken ones.
+// Several modules, an example in C, and broken ones.
 
 #include <string>
 
@@ -38,6 +38,27 @@ TEST_F(Modules, ConnectingACameraOfOneDisconnectsTheOthers) {
   helper.send(request("connectDevice", 6, 0x0109));
   EXPECT_EQ(helper.awaitAnswer(6).number("error_code"), -1);
   EXPECT_EQ(settingsError(7, kStudio), "No camera is connected");
+}
+
+TEST_F(Modules, TheExampleInCIsLoadedListedReadFiredAndDelivers) {
+  constexpr double kExample = 0x0501;
+  helper.install("Type0005Module", EXAMPLE_MODULE, "example");
+  helper.start();
+  EXPECT_EQ(helper.await("deviceAdded").text("name"), "Example");
+  helper.send(request("connectDevice", 1, kExample));
+  const Message& settings = helper.await("cameraSettingsChanged");
+  EXPECT_EQ(settings.number("isoSpeed"), 200);
+  EXPECT_EQ(settings.number("batteryLevel"), -1);
+  EXPECT_EQ(settings.text("aperture"), "f/4");
+  EXPECT_EQ(settings.text("whiteBalance"), "Sunny");
+  EXPECT_TRUE(settings.isNil("shutter"));
+  std::string picture(1000, '\0');
+  for (std::size_t i = 0; i < picture.size(); ++i) picture[i] = static_cast<char>(i * 7);
+  for (const char* name : {"Capture0001.tif", "Capture0002.tif"}) {
+    helper.send(request("doCapture", 2));
+    EXPECT_EQ(helper.await("fileDownloadComplete").text("file_path"), helper.temporary() / name);
+    EXPECT_TRUE(readFile(helper.temporary() / name) == picture);
+  }
 }
 
 TEST_F(Modules, ThatDoNotLoadOrOpenAreSkippedAndTheOthersWork) {
