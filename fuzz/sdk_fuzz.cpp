@@ -33,6 +33,12 @@ constexpr std::size_t kMostItems = 2;
 // A module may announce 4 GiB. So much is not written; more of it is a disk that is full.
 constexpr rlim_t kLargestFile = 1 << 18;
 
+constexpr std::int32_t kCapabilities[] = {
+    kNkMAIDCapability_Name,         kNkMAIDCapability_IsAlive,      kNkMAIDCapability_DataTypes,
+    kNkMAIDCapability_StoredBytes,  kNkMAIDCapability_BatteryLevel, kNkMAIDCapability_FreeBytes,
+    kNkMAIDCapability_ExposureMode, kNkMAIDCapability_Aperture,     kNkMAIDCapability_Sensitivity,
+    kNkMAIDCapability_WBMode,       kNkMAIDCapability_SaveMedia,    kNkMAIDCapability_Children};
+
 std::map<double, double> announcedSizes;  // by capture id
 
 double numberIn(const KtLuaTETable& table, const char* key) {
@@ -78,8 +84,7 @@ class FileSizeLimit {
 
 void readEverything(CNikonObject& object) {
   object.debugDumpCapabilities();
-  for (const auto& [capability, type] : fuzz::usualCapabilities) {
-    const auto id = static_cast<std::int32_t>(capability);
+  for (const std::int32_t id : kCapabilities) {
     std::int32_t number = 0;
     bool truth = false;
     std::string text;
