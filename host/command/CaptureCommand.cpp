@@ -31,12 +31,12 @@ class Capture {
       while (!isDone()) step();
     } catch (const Failure& failure) {
       finish(failure.status);
-      if (failure.status != kInterrupted && !missing().empty()) throw Failure{failure.status, failure.text + missing()};
-      throw;
+      if (failure.status == kInterrupted || missing().empty()) throw;
+      throw Failure{failure.status, failure.text.empty() ? missing() : failure.text + "; " + missing()};
     }
     finish(kSuccess);
     if (_pictures.notSaved() > 0) return kNotSaved;
-    if (_lost > 0) throw Failure{kHelperLost, missing().substr(2)};
+    if (_lost > 0) throw Failure{kHelperLost, missing()};
     return _console.closed() ? kUnwritable : kSuccess;
   }
 
@@ -49,7 +49,7 @@ class Capture {
   }
 
   Clock::time_point nextShutter() const {
-    if (_released >= _count || _pictures.notSaved() > 0) return Clock::time_point::max();
+    if (_released >= _count || _pictures.notSaved() > 0 || _console.closed()) return Clock::time_point::max();
     if (_options.every) return _begun + *_options.every * _released;
     return outstanding() == 0 ? Clock::time_point::min() : Clock::time_point::max();
   }
@@ -115,11 +115,11 @@ class Capture {
     _pictures.giveUp("the helper has ended");
   }
 
-  // What of the pictures asked for is not there, to be put behind another sentence.
+  // What of the pictures asked for is not there, in words.
   std::string missing() const {
     const int there = std::min(_count, _pictures.done());
     if (there >= _count) return {};
-    return "; " + std::to_string(_count - there) + " of " + std::to_string(_count) +
+    return std::to_string(_count - there) + " of " + std::to_string(_count) +
            (_count == 1 ? " picture is missing" : " pictures are missing");
   }
 

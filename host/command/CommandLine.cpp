@@ -12,7 +12,7 @@ constexpr double kLongestTime = 7 * 24 * 3600;  // in seconds
 const char* const kStatuses =
     "Exit status:\n"
     "  0    done\n"
-    "  1    standard output was closed\n"
+    "  1    standard output was closed, or takes nothing more\n"
     "  2    wrong usage\n"
     "  3    no camera, no such camera, or it cannot be connected\n"
     "  4    something did not come in time\n"
@@ -173,6 +173,10 @@ Parsed parseCommandLine(int argc, char** argv) {
     app.parse(argc, argv);
   } catch (const CLI::ParseError& error) {
     parsed.status = app.exit(error, std::cout, std::cerr) == 0 ? kSuccess : kUsage;
+    if (!std::cout.flush()) {
+      std::cerr << "tether: cannot write to standard output\n";
+      parsed.status = kUnwritable;
+    }
     return parsed;
   }
   const CLI::App& chosen = *app.get_subcommands().front();

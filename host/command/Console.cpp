@@ -1,11 +1,13 @@
 #include "Console.h"
 
+#include <poll.h>
 #include <sys/ioctl.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
 #include <cstdlib>
+#include <cstring>
 #include <string_view>
 
 namespace tether::command {
@@ -21,7 +23,13 @@ bool isLiveTerminal() {
 bool writeAll(int descriptor, std::string_view text) {
   while (!text.empty()) {
     const ssize_t written = write(descriptor, text.data(), text.size());
-    if (written < 0 && errno != EINTR) return false;
+    if (written < 0 && errno == EAGAIN) {
+      // Whoever shares the descriptor may have made it one that does not wait.
+      pollfd ready{descriptor, POLLOUT, 0};
+      poll(&ready, 1, -1);
+    } else if (written < 0 && errno != EINTR) {
+      return false;
+    }
     if (written > 0) text.remove_prefix(static_cast<std::size_t>(written));
   }
   return true;
@@ -55,7 +63,11 @@ void Console::writeLine(std::string line) {
   const std::lock_guard guard(_lock);
   replaceStatus("");
   line += '\n';
-  if (!_closed && !writeAll(STDOUT_FILENO, line)) _closed = true;
+  if (_closed || writeAll(STDOUT_FILENO, line)) return;
+  _closed = true;
+  // A reader that has seen enough is no fault.
+  if (errno == EPIPE) return;
+  writeAll(STDERR_FILENO, std::string("tether: cannot write to standard output: ") + std::strerror(errno) + "\n");
 }
 
 void Console::say(const std::string& text) {
