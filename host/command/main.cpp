@@ -1,4 +1,5 @@
 // The command `tether`.
+#include <fcntl.h>
 #include <unistd.h>
 
 #include <csignal>
@@ -25,6 +26,16 @@ void noteSignal(int) {
   signals = signals + 1;
   if (signals >= kSignalsToLeave) _exit(kInterrupted);
   signalled->interrupt();
+}
+
+// What is opened in a closed standard descriptor's place would get the lines that are meant for it: a picture's copy,
+// for one. Writing to this fails as it does to a closed one.
+void occupyClosedDescriptors() {
+  while (true) {
+    const int descriptor = open("/dev/null", O_RDONLY);
+    if (descriptor > STDERR_FILENO) close(descriptor);
+    if (descriptor < 0 || descriptor > STDERR_FILENO) return;
+  }
 }
 
 // A signal that whoever started this wants ignored (nohup, a shell's background job) stays ignored.
@@ -69,6 +80,7 @@ int run(const Parsed& parsed, Console& console, const std::shared_ptr<Wakeup>& w
 }  // namespace
 
 int main(int argc, char** argv) {
+  occupyClosedDescriptors();
   const Parsed parsed = parseCommandLine(argc, argv);
   if (parsed.subcommand.empty()) return parsed.status;
   // Never destroyed: a signal may come until the very end.
