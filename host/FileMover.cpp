@@ -6,6 +6,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <cstdlib>
 #include <cstring>
 #include <initializer_list>
 #include <string_view>
@@ -34,6 +35,13 @@ bool cannotLink(int error) { return isOneOf(error, {EPERM, ENOSYS, ENOTSUP, EOPN
 std::string bareName(const std::string& name) {
   std::string bare(platform::lastPathComponent(name));
   return bare.empty() || bare == "." || bare == ".." ? "Picture" : bare;
+}
+
+Descriptor makeHidden(std::string& name) {
+  const std::lock_guard guard(spawnLock());
+  Descriptor file(mkstemp(name.data()));
+  if (file) fcntl(file.get(), F_SETFD, FD_CLOEXEC);
+  return file;
 }
 
 }  // namespace
@@ -109,8 +117,7 @@ MovedFile FileMover::move(const std::string& source, const std::string& announce
 
   int error = place(source, name);
   if (error == EXDEV) {
-    const std::string hidden = platform::appendingPathComponent(
-        _folder, "." + name.file() + "." + std::to_string(getpid()) + "." + std::to_string(status.st_ino));
+    std::string hidden = platform::appendingPathComponent(_folder, "." + name.file() + ".XXXXXX");
     error = copy(source, hidden, status.st_size);
     if (error == 0) {
       error = place(hidden, name);
@@ -155,12 +162,14 @@ int FileMover::placeAs(const std::string& from, const std::string& to) {
   return error;
 }
 
-int FileMover::copy(const std::string& source, const std::string& hidden, std::int64_t size) {
+// The end of the hidden name is chosen here: one that a killed process left must not be in the way.
+int FileMover::copy(const std::string& source, std::string& hidden, std::int64_t size) {
   const Descriptor from(open(source.c_str(), O_RDONLY | O_NOFOLLOW | O_CLOEXEC));
   struct stat status {};
   if (!from || fstat(from.get(), &status) != 0) return errno;
-  const Descriptor to(open(hidden.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, _mode));
-  if (!to) return errno == EEXIST ? EBUSY : errno;
+  const Descriptor to = makeHidden(hidden);
+  if (!to) return errno;
+  fchmod(to.get(), _mode);
   int error = copyBytes(from.get(), to.get(), size);
   if (error == 0) error = _calls->flush(to.get());
   if (error == 0) {

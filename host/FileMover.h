@@ -4,7 +4,7 @@
 // "name-2.jpg", "name-3.jpg" and so on. A file is renamed where that is possible. Into another file system it is copied
 // under a hidden name in the folder, checked for its size, flushed to disk, given its name, the folder flushed, and
 // only then the first copy removed. Whatever goes wrong leaves the first copy where it is and nothing half in the
-// folder.
+// folder; only a process that is killed meanwhile may leave the hidden name there.
 #pragma once
 
 #include <sys/types.h>
@@ -57,7 +57,7 @@ class FileMover {
   struct Name;
   int place(const std::string& from, Name& name);
   int placeAs(const std::string& from, const std::string& to);
-  int copy(const std::string& source, const std::string& hidden, std::int64_t size);
+  int copy(const std::string& source, std::string& hidden, std::int64_t size);
   int copyBytes(int from, int to, std::int64_t size);
   int flushFolder();
 
