@@ -21,7 +21,7 @@ std::string withCount(std::size_t count, const std::string& noun) {
 Pictures::Pictures(const std::string& folder, Console& console) : _console(console), _mover(folder) {
   std::error_code error;
   std::filesystem::create_directories(folder, error);
-  if (!std::filesystem::is_directory(folder)) {
+  if (!platform::FileManager::isDirectory(folder)) {
     throw Failure{kNotSaved, "cannot make the folder " + folder + (error ? ": " + error.message() : "")};
   }
 }
