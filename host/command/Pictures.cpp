@@ -97,6 +97,8 @@ void Pictures::completed(const FileDownloadComplete& complete, const std::option
   const MovedFile moved = _mover.move(complete.file_path, picture.object.file_name, first,
                                       picture.pair ? picture.pair->base : std::nullopt);
   if (moved.moved && first) picture.pair->base = moved.base;
+  // A slow copy is no silence of the camera: what came meanwhile has not been looked at.
+  _lastProgress = Clock::now();
   report(picture, moved);
   finish(picture);
 }
