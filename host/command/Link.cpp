@@ -19,6 +19,9 @@ constexpr auto kSilenceBeyondTimeout = std::chrono::milliseconds(10s);
 constexpr auto kCameraPatience = 3s;
 constexpr std::size_t kMostLosses = 3;
 constexpr auto kLossWindow = 60s;
+constexpr auto kEndGrace = 2s;
+
+void dropEvent(const Event&) {}
 
 }  // namespace
 
@@ -30,7 +33,7 @@ Link::Link(const Options& options, Console& console, std::shared_ptr<Wakeup> wak
   if (!_log) throw Failure{kUsage, "cannot write " + path + ": " + std::strerror(errno)};
 }
 
-Link::~Link() = default;
+Link::~Link() { end(kEndGrace, dropEvent); }
 
 std::chrono::milliseconds Link::timeout() const { return _options.timeout.value_or(kDefaultTimeout); }
 
@@ -62,7 +65,7 @@ void Link::restart(const HelperLost& lost) {
     throw Failure{kHelperLost, lost.description + ", too often within a minute; giving up"};
   }
   _console.say(lost.description + "; starting it again");
-  end(0s, [](const Event&) {});
+  end(0s, dropEvent);
   start();
   _console.result("", {{"event", "helper_started"}});
 }
@@ -72,6 +75,7 @@ void Link::end(std::chrono::milliseconds grace, const Take& take) {
   _session->end(grace);
   while (const auto message = _session->nextMessage(Clock::now())) take(eventFrom(*message));
   for (const std::string& path : _session->directory().tidy()) _console.say("left where it is: " + path);
+  _session.reset();
 }
 
 void Link::finishing() {

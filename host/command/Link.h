@@ -27,14 +27,15 @@ class Link {
   Link(const Options& options, Console& console, std::shared_ptr<Wakeup> wakeup);
   Link(const Link&) = delete;
   Link& operator=(const Link&) = delete;
-  // Ends the helper.
+  // As end() with a short grace; nobody takes what the helper still sends.
   ~Link();
 
   // Starts a helper. Throws Failure when that cannot be done.
   void start();
   // After a HelperLost event: says so and starts another. Throws Failure when it was lost too often.
   void restart(const HelperLost& lost);
-  // Ends the helper, hands over what it still sent, and says which files stay in its directory.
+  // Ends the helper, hands over what it still sent, and says which files stay in its directory. Without a helper it
+  // does nothing.
   void end(std::chrono::milliseconds grace, const Take& take);
 
   // The next event; cameras() is up to date with it. Nothing when none came in time. Throws Failure when the user
