@@ -25,8 +25,7 @@ class Capture {
   int run() {
     try {
       _link.start();
-      _camera = _link.choose();
-      _link.connect(_camera);
+      connect();
       _begun = Clock::now();
       while (!isDone()) step();
     } catch (const Failure& failure) {
@@ -41,7 +40,8 @@ class Capture {
   }
 
  private:
-  int outstanding() const { return std::max(0, _released - _lost - _pictures.done()); }
+  int done() const { return _pictures.done() - _earlier; }
+  int outstanding() const { return std::max(0, _released - _lost - done()); }
 
   bool isDone() const {
     const bool allReleased = _released >= _count || _pictures.notSaved() > 0;
@@ -94,8 +94,36 @@ class Capture {
     _lost += outstanding();
     if (_released >= _count) throw Failure{kHelperLost, lost.description};
     _link.restart(lost);
-    _camera = _link.choose();
-    _link.connect(_camera);
+    connect();
+  }
+
+  // What the camera had already when it was connected is saved too, but is none of the pictures asked for.
+  void connect() {
+    const int before = _pictures.done();
+    while (!tryToConnect()) {
+    }
+    _earlier += _pictures.done() - before;
+  }
+
+  // False when the helper was lost meanwhile, and there is a new one.
+  bool tryToConnect() {
+    try {
+      _camera = _link.choose([this](const Event& event) { _pictures.take(event, std::nullopt); });
+      _link.connect(_camera);
+      const auto until = [this] {
+        return _pictures.underWay() > 0 ? _pictures.lastProgress() + _link.timeout() : Clock::now();
+      };
+      while (const auto event = _link.next(until())) {
+        if (const auto* const lost = std::get_if<HelperLost>(&*event)) throw Failure{kHelperLost, lost->description};
+        handle(*event);
+      }
+      return true;
+    } catch (const Failure& failure) {
+      if (failure.status != kHelperLost) throw;
+      _pictures.giveUp(failure.text);
+      _link.restart(HelperLost(*_link.session().lost()));
+      return false;
+    }
   }
 
   void showStatus() {
@@ -117,7 +145,7 @@ class Capture {
 
   // What of the pictures asked for is not there, in words.
   std::string missing() const {
-    const int there = std::min(_count, _pictures.done());
+    const int there = std::min(_count, done());
     if (there >= _count) return {};
     return std::to_string(_count - there) + " of " + std::to_string(_count) +
            (_count == 1 ? " picture is missing" : " pictures are missing");
@@ -133,6 +161,7 @@ class Capture {
   Clock::time_point _lastRelease;
   int _released = 0;
   int _lost = 0;
+  int _earlier = 0;
 };
 
 }  // namespace

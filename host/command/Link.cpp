@@ -122,21 +122,25 @@ std::optional<Camera> Link::wanted() const {
   return found;
 }
 
-Camera Link::choose() {
+Camera Link::choose(const Take& take) {
   Reply reply;
   reply.kind = _session->awaitListing(Clock::now() + timeout());
   if (reply.kind != Reply::Kind::kOk) fail(reply, "the list of cameras");
   const auto patience = _startedAt + kCameraPatience;
+  const auto takeNext = [&](Clock::time_point until) {
+    const auto event = next(until);
+    if (!event) return false;
+    if (const auto* const lost = std::get_if<HelperLost>(&*event)) throw Failure{kHelperLost, lost->description};
+    take(*event);
+    return true;
+  };
   for (;;) {
     // What the listing brought is taken before anything is chosen from it.
-    while (const auto event = next(Clock::now())) {
-      if (const auto* const lost = std::get_if<HelperLost>(&*event)) throw Failure{kHelperLost, lost->description};
+    while (takeNext(Clock::now())) {
     }
     if (const auto camera = wanted()) return *camera;
     if (Clock::now() >= patience) failWithoutCamera();
-    const auto event = next(patience);
-    if (!event) continue;
-    if (const auto* const lost = std::get_if<HelperLost>(&*event)) throw Failure{kHelperLost, lost->description};
+    takeNext(patience);
   }
 }
 

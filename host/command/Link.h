@@ -51,8 +51,9 @@ class Link {
 
   // Whether this is a camera that the user asked for, or one like the camera that was chosen before.
   bool isWanted(const Camera& camera) const;
-  // Waits for the listing, and up to 3 seconds from the helper's start for a wanted camera. Throws Failure.
-  Camera choose();
+  // Waits for the listing, and up to 3 seconds from the helper's start for a wanted camera. Hands over whatever comes
+  // meanwhile. Throws Failure.
+  Camera choose(const Take& take);
   // Connects; throws Failure. Remembers the camera, so that it is wanted when it comes back under another id.
   void connect(const Camera& camera);
 

@@ -11,7 +11,7 @@ constexpr std::size_t kNameWidth = 16;
 int runSettings(const Options& options, Console& console, const std::shared_ptr<Wakeup>& wakeup) {
   Link link(options, console, wakeup);
   link.start();
-  const Camera camera = link.choose();
+  const Camera camera = link.choose([](const Event&) {});
   link.connect(camera);
   const Reply reply = link.session().settings(camera.id, Clock::now() + link.timeout());
   if (reply.kind != Reply::Kind::kOk) link.fail(reply, "reading the settings of " + camera.name);
