@@ -160,12 +160,17 @@ std::string Pictures::status() const {
          secondsText(Clock::now() - picture.announced);
 }
 
-// Until nothing is under way, or nothing more comes in time.
+// What the camera still owes, announced or not: released shutters, and the other file of a pair.
+std::size_t Pictures::expected() const {
+  return _underWay.size() + _shutters.size() + (_openPair && _openPair->files == 1 ? 1 : 0);
+}
+
+// Until nothing is expected, or nothing more comes in time.
 void Pictures::takeUntil(Clock::time_point until, Link& link) {
   while (const auto event = link.next(until)) {
     if (std::holds_alternative<HelperLost>(*event)) return;
     take(*event, std::nullopt);
-    if (_underWay.empty() && Clock::now() < until) return;
+    if (expected() == 0 && Clock::now() < until) return;
   }
 }
 
@@ -174,8 +179,8 @@ void Pictures::waitBriefly(Link& link) {
   try {
     // What has been announced by now counts as under way.
     takeUntil(Clock::now(), link);
-    if (_underWay.empty()) return;
-    _console.say("waiting up to 5 seconds for " + withCount(underWay(), "picture") +
+    if (expected() == 0) return;
+    _console.say("waiting up to 5 seconds for " + withCount(expected(), "picture") +
                  " under way; Ctrl-C again to leave");
     takeUntil(Clock::now() + kBriefly, link);
   } catch (const Failure&) {

@@ -36,7 +36,8 @@ class Pictures {
   // "Capture0001.jpg 12.3 MB receiving 1.2 s", or "".
   std::string status() const;
 
-  // Waits up to 5 seconds for what is under way, after the user asked to end; a second Ctrl-C ends that too.
+  // Waits up to 5 seconds for what is under way, pictures whose shutter was released among it, after the user asked to
+  // end; a second Ctrl-C ends that too.
   void waitBriefly(Link& link);
 
  private:
@@ -64,6 +65,7 @@ class Pictures {
   void finish(const Picture& picture);
   void closePair();
   Clock::time_point takeShutterTime();
+  std::size_t expected() const;
   void takeUntil(Clock::time_point until, Link& link);
   void report(const Picture& picture, const MovedFile& moved);
 

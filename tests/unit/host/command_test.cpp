@@ -293,6 +293,8 @@ TEST_F(TetherTest, AnInterruptionIs130AndLeavesNothing) {
     start(camera("[[]]"), {"capture"});
     ASSERT_TRUE(helper->awaitNote("request doCapture"));
     kill(process, signal);
+    EXPECT_TRUE(awaitText("err", "for 1 picture under"));  // the released shutter's; a second signal leaves it
+    kill(process, signal);
     EXPECT_EQ(wait(), 130);
     EXPECT_THAT(temporary.names(), IsEmpty());
     EXPECT_EQ(helper->notes("request shutdown").size(), 1U);
