@@ -94,8 +94,8 @@ class Helper {
     eventually([&] { return notes("start ").size() > nth; });
     return static_cast<pid_t>(std::stol(notes("start ").at(nth)));
   }
-  std::string directory() const {
-    const std::string line = notes("start ").at(0);
+  std::string directory(std::size_t nth = 0) const {
+    const std::string line = notes("start ").at(nth);
     return line.substr(line.find(' ') + 1);
   }
 
