@@ -8,6 +8,7 @@
 #include <chrono>
 #include <cstring>
 #include <mutex>
+#include <utility>
 
 #include "ContentContainer.h"
 #include "DebugTrace.h"
@@ -119,6 +120,7 @@ CContentData::CContentData(CContentContainer* container, std::int32_t dataType, 
 
 CContentData::~CContentData() {
   closeGate();
+  reportFinishedFile();  // the wait may have ended between the last delivery and the completion
   const std::lock_guard guard(deliveryLock());
   giveFileUp();
 }
@@ -273,6 +275,14 @@ void CContentData::giveRestedBufferBack() {
 
 // The end.
 
+void CContentData::reportFinishedFile() {
+  {
+    const std::lock_guard guard(deliveryLock());
+    if (!_finished || std::exchange(_reported, true)) return;
+  }
+  NikonTetherService::getSingleton()->fileDownloadComplete(_captureId, _path);
+}
+
 void CContentData::completionCallback_thread(std::int32_t command, std::int32_t result, void* /*context*/) {
   debugmsgstr("CContentData completionCallback: %s", commandToName(command));
   bool finished = false;
@@ -285,7 +295,7 @@ void CContentData::completionCallback_thread(std::int32_t command, std::int32_t 
       _abandoned = true;
     }
   }
-  if (finished) NikonTetherService::getSingleton()->fileDownloadComplete(_captureId, _path);
+  if (finished) reportFinishedFile();
   closeNikonObject();
   if (auto* const container = dynamic_cast<CContentContainer*>(parent())) container->contentFinishedDownloading(this);
 }

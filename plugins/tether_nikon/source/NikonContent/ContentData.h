@@ -50,6 +50,7 @@ class CContentData : public CNikonThreadedObject {
   void store(const tagNkMAIDFileInfo& info, const void* data);
   void finishFile();
   void giveFileUp();
+  void reportFinishedFile();  // once
 
   static std::int32_t _fileNumber;
 
@@ -60,6 +61,7 @@ class CContentData : public CNikonThreadedObject {
   platform::MemoryBlock _buffer;                 // the whole file, in its first _dataSize bytes
   std::size_t _known = 0;                        // so many bytes of it are delivered ones, or zero
   bool _finished = false;                        // the file is written
+  bool _reported = false;                        // and the host knows
   std::int32_t _captureId = 0;
   std::string _fileName;
   std::string _path;
