@@ -138,6 +138,9 @@ void CContentData::giveFileUp() {
 
 void CContentData::startDownload(const std::string& name) {
   _fileName = name;
+  // From here on the download thread waits for this object: a delivery carried to it would wait for it, and it for the
+  // delivery.
+  setDownloadThread(nullptr);
   issueCommand(kNkMAIDCapability_Acquire, this, nullptr);
 }
 

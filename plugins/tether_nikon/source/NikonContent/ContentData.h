@@ -1,7 +1,8 @@
 // The image data of one item: asks the SDK for it, collects its deliveries and writes the file.
 //
-// The data object that an item opens while it is being initialised has no download thread: its callbacks run where the
-// SDK delivers them. One delivery of the process is handled at a time.
+// The data object that an item opens while it is being initialised has no download thread, and one that was opened
+// later has none once its transfer starts: callbacks run where the SDK delivers them. One delivery of the process is
+// handled at a time.
 #pragma once
 
 #include <cstdint>

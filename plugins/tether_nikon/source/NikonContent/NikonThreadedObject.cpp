@@ -68,7 +68,9 @@ MessageForwardPackage MessageForwardPackage::initEventNotificationWithTargetObje
 }
 
 void MessageForwardPackage::performOnDownloadThread() {
-  const auto home = _targetObject->downloadThread()->homeThread()->runLoop();
+  NikonDownloadThread* const thread = _targetObject->downloadThread();
+  if (thread == nullptr) return forwardMessage();  // the object gave it up meanwhile
+  const auto home = thread->homeThread()->runLoop();
   // Whoever deletes the target on the download thread must not wait for this thread, which waits for that one.
   const CallbackGate::StepOut outside(_gate);
   home->perform([this] { forwardMessage(); });
