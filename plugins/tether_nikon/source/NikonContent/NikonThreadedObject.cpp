@@ -69,7 +69,8 @@ MessageForwardPackage MessageForwardPackage::initEventNotificationWithTargetObje
 
 void MessageForwardPackage::performOnDownloadThread() {
   NikonDownloadThread* const thread = _targetObject->downloadThread();
-  if (thread == nullptr) return forwardMessage();  // the object gave it up meanwhile
+  // The object may have given it up meanwhile. And it may wait for the outer callback, which would wait for this one.
+  if (thread == nullptr || CallbackGate::Entry::isNested()) return forwardMessage();
   const auto home = thread->homeThread()->runLoop();
   // Whoever deletes the target on the download thread must not wait for this thread, which waits for that one.
   const CallbackGate::StepOut outside(_gate);

@@ -1,7 +1,7 @@
 // An SDK object whose callbacks run on the download thread. One that arrives on another thread is carried there, and
 // the delivering thread waits until it has run, so that what the SDK passed stays valid meanwhile.
 //
-// Without a download thread the callbacks run where they are delivered.
+// Without a download thread, and from inside another callback, they run where they are delivered.
 #pragma once
 
 #include <atomic>

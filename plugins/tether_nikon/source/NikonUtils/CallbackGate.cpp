@@ -6,6 +6,7 @@
 namespace {
 
 std::mutex gatesLock;
+thread_local int staysOfThisThread = 0;
 
 // Never destroyed: callbacks may come until the last moment of the process.
 std::unordered_map<const void*, std::shared_ptr<CallbackGate>>& gates() {
@@ -90,8 +91,13 @@ CallbackGate::Entry::Entry(std::shared_ptr<CallbackGate> gate) {
   if (gate->_state != State::open) return;
   gate->_inside.push_back(std::this_thread::get_id());
   _gate = std::move(gate);
+  ++staysOfThisThread;
 }
 
 CallbackGate::Entry::~Entry() {
-  if (_gate) _gate->leave();
+  if (!_gate) return;
+  --staysOfThisThread;
+  _gate->leave();
 }
+
+bool CallbackGate::Entry::isNested() { return staysOfThisThread > 1; }

@@ -40,6 +40,8 @@ class CallbackGate {
     ~Entry();
     // Whether it was let in.
     explicit operator bool() const { return _gate != nullptr; }
+    // Whether the calling thread is inside more than one callback: the SDK was called from one and delivered another.
+    static bool isNested();
 
    private:
     std::shared_ptr<CallbackGate> _gate;
