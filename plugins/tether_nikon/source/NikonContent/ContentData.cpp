@@ -137,7 +137,11 @@ void CContentData::giveFileUp() {
 }
 
 void CContentData::startDownload(const std::string& name) {
-  _fileName = name;
+  {
+    // A delivery may have come already, or be coming on another thread.
+    const std::lock_guard guard(deliveryLock());
+    if (!_file) _fileName = name;
+  }
   // From here on the download thread waits for this object: a delivery carried to it would wait for it, and it for the
   // delivery.
   setDownloadThread(nullptr);
