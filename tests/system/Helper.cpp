@@ -309,6 +309,14 @@ std::size_t Helper::count(const std::string& name) const {
       std::count_if(messages_.begin(), messages_.end(), [&](const Message& message) { return message.name == name; }));
 }
 
+std::optional<Message> Helper::next(Clock::time_point limit) {
+  while (messages_.empty() && readUntil(limit)) continue;
+  if (messages_.empty()) return std::nullopt;
+  Message message = std::move(messages_.front());
+  messages_.pop_front();
+  return message;
+}
+
 // Files.
 
 void awaitCondition(const std::string& what, const std::function<bool()>& condition) {

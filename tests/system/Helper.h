@@ -84,6 +84,8 @@ class Helper {
   void settle();
   const std::deque<Message>& messages() const { return messages_; }
   std::size_t count(const std::string& name) const;
+  // The oldest message, which is kept no longer; nothing when none came until then, or the output has ended.
+  std::optional<Message> next(Clock::time_point limit);
 
   // The exit status, or the signal that ended it as a negative number.
   enum class Reading { yes, no };

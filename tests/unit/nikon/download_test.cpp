@@ -161,6 +161,25 @@ TEST_F(ServiceTest, DeliveriesArriveWholeWhicheverThreadBringsThem) {
   }
 }
 
+// Opened by the download thread, which then waits for what the others carry to it.
+TEST_F(ServiceTest, DeliveriesOnOtherThreadsReachADataObjectThatOpenedLate) {
+  auto& camera = model.addCamera(1, "One");
+  camera.setTransfer({.deliveryBytes = 100, .inModulePolls = true});
+  for (unsigned item = 1; item <= 40; ++item) {
+    model.faults().add({.level = Level::Data,
+                        .item = item,
+                        .command = kNkMAIDCommand_Open,
+                        .times = 1,
+                        .answer = kNkMAIDResult_HardwareError});
+    if (item % 2 == 0)
+      model.faults().add({.level = Level::Data, .item = item, .command = kNkMAIDCommand_CapStart, .ownThread = true});
+  }
+  start();
+  for (int shot = 0; shot < 40; ++shot) camera.shoot(Picture::jpeg(bytes(995, shot)));
+  idleUntil("fileDownloadComplete", 40);
+  EXPECT_EQ(read(recorder.await("fileDownloadComplete", 40).strings.at("file_path")), bytes(995, 39));
+}
+
 TEST_F(ServiceTest, TheEndOfTheServiceWaitsForTheTransferAndGivesTheQueueUp) {
   auto& camera = model.addCamera(1, "One");
   camera.setTransfer({.deliveryBytes = 1000, .pollsPerDelivery = 10});
