@@ -88,6 +88,17 @@ const char* extensionOf(std::uint32_t fileDataType) {
   }
 }
 
+// Answers how much was written. A signal does not end it; that one can interrupt a write some file systems insist on.
+std::size_t writeWhole(const char* bytes, std::size_t size, std::FILE* file) {
+  std::size_t written = 0;
+  do {
+    errno = 0;
+    std::clearerr(file);
+    written += std::fwrite(bytes + written, 1, size - written, file);
+  } while (written < size && errno == EINTR);
+  return written;
+}
+
 std::uint64_t endOf(const tagNkMAIDFileInfo& info) { return std::uint64_t{info.ulStart} + info.ulLength; }
 
 }  // namespace
@@ -207,7 +218,7 @@ bool CContentData::openFile() {
     _path = MakeUniqueFilePath(directory, _fileName);
     // A file of its own: no link is followed, nothing is taken over. Only the owner can read it.
     const int descriptor = open(_path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600);
-    if (descriptor < 0 && errno == EEXIST) continue;
+    if (descriptor < 0 && (errno == EEXIST || errno == EINTR)) continue;
     if (descriptor < 0) return false;
     _file.reset(fdopen(descriptor, "wb"));
     if (!_file) {
@@ -258,7 +269,7 @@ void CContentData::zeroUpTo(std::size_t end) {
 void CContentData::finishFile() {
   const std::size_t size = static_cast<std::uint32_t>(_dataSize);
   zeroUpTo(size);
-  const std::size_t written = std::fwrite(_buffer.data(), 1, size, _file.get());
+  const std::size_t written = writeWhole(_buffer.data(), size, _file.get());
   int error = errno;
   const bool closed = std::fclose(_file.release()) == 0;
   if (written == size) error = errno;
