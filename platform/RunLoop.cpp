@@ -82,9 +82,11 @@ Clock::duration toClock(Seconds seconds) { return std::chrono::duration_cast<Clo
 }  // namespace
 
 const std::shared_ptr<RunLoop>& RunLoop::current() {
-  if (!threadLoop) threadLoop = std::shared_ptr<RunLoop>(new RunLoop);
+  if (!threadLoop) threadLoop = make();
   return threadLoop;
 }
+
+void RunLoop::setCurrent(std::shared_ptr<RunLoop> loop) { threadLoop = std::move(loop); }
 
 void RunLoop::endCurrent() {
   if (!threadLoop) return;

@@ -40,6 +40,10 @@ class RunLoop : public std::enable_shared_from_this<RunLoop> {
   static const std::shared_ptr<RunLoop>& current();
   // Ends the calling thread's loop, if it has one. Thread does this when its function returns.
   static void endCurrent();
+  // A loop for a thread that is about to be started, which makes it its own before it asks for current(). Throws
+  // std::system_error when the system has no descriptors left; current() does so for a loop that it has to make.
+  static std::shared_ptr<RunLoop> make() { return std::shared_ptr<RunLoop>(new RunLoop); }
+  static void setCurrent(std::shared_ptr<RunLoop> loop);
 
   RunLoop(const RunLoop&) = delete;
   RunLoop& operator=(const RunLoop&) = delete;

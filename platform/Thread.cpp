@@ -27,14 +27,16 @@ std::shared_ptr<Thread> Thread::current() {
 }
 
 void Thread::start() {
-  std::thread([self = shared_from_this()] { self->main(); }).detach();
+  // The loop is made here, where it can be told that there is none to be had.
+  std::thread([self = shared_from_this(), loop = RunLoop::make()] { self->main(loop); }).detach();
 }
 
-void Thread::main() {
+void Thread::main(const std::shared_ptr<RunLoop>& loop) {
   currentThread = shared_from_this();
+  RunLoop::setCurrent(loop);
   {
     std::lock_guard guard(_lock);
-    _runLoop = RunLoop::current();
+    _runLoop = loop;
     _changed.notify_all();
   }
   _body();

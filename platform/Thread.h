@@ -18,7 +18,7 @@ class Thread : public std::enable_shared_from_this<Thread> {
   // The calling thread; one that was not made here is adopted.
   static std::shared_ptr<Thread> current();
 
-  // Throws std::system_error when the system has no thread to give. Once only.
+  // Throws std::system_error when the system has no thread to give, or no descriptors for its loop. Once only.
   void start();
   // Asks the thread to end; its body looks when it likes. Also ends a wait of its run loop.
   void cancel();
@@ -36,7 +36,7 @@ class Thread : public std::enable_shared_from_this<Thread> {
 
  private:
   explicit Thread(std::function<void()> body);
-  void main();
+  void main(const std::shared_ptr<RunLoop>& loop);
 
   const int _number;
   std::function<void()> _body;
