@@ -17,6 +17,7 @@
 #include "Log.h"
 #include "NotificationCenter.h"
 #include "RunLoop.h"
+#include "Thread.h"
 
 #if defined(__SANITIZE_ADDRESS__)
 #include <sanitizer/lsan_interface.h>
@@ -83,7 +84,7 @@ void startWatching() {
   action.sa_flags = SA_RESTART;
   sigaction(SIGTERM, &action, nullptr);
   sigaction(SIGINT, &action, nullptr);
-  std::thread([signals = ends[0], mainLoop = RunLoop::current()] { watchForTheEnd(signals, *mainLoop); }).detach();
+  startDetached([signals = ends[0], mainLoop = RunLoop::current()] { watchForTheEnd(signals, *mainLoop); });
 }
 
 }  // namespace

@@ -2,6 +2,7 @@
 
 #include <pthread.h>
 
+#include <system_error>
 #include <thread>
 
 namespace platform {
@@ -11,6 +12,14 @@ std::atomic<int> lastNumber{0};
 thread_local std::shared_ptr<Thread> currentThread;
 
 }  // namespace
+
+void startDetached(std::function<void()> body) {
+  try {
+    std::thread(std::move(body)).detach();
+  } catch (const std::system_error& error) {
+    throw std::system_error(error.code(), "no thread");
+  }
+}
 
 Thread::Thread(std::function<void()> body) : _number(++lastNumber), _body(std::move(body)) {}
 
@@ -28,7 +37,7 @@ std::shared_ptr<Thread> Thread::current() {
 
 void Thread::start() {
   // The loop is made here, where it can be told that there is none to be had.
-  std::thread([self = shared_from_this(), loop = RunLoop::make()] { self->main(loop); }).detach();
+  startDetached([self = shared_from_this(), loop = RunLoop::make()] { self->main(loop); });
 }
 
 void Thread::main(const std::shared_ptr<RunLoop>& loop) {

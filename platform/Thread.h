@@ -12,6 +12,9 @@
 
 namespace platform {
 
+// Starts a thread that nobody waits for. Throws std::system_error, which says so, when the system has none to give.
+void startDetached(std::function<void()> body);
+
 class Thread : public std::enable_shared_from_this<Thread> {
  public:
   static std::shared_ptr<Thread> make(std::function<void()> body);
