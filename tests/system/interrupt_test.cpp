@@ -32,6 +32,9 @@ constexpr int kRuns = 100;
 constexpr int kAtOnce = 8;
 constexpr int kPictures = 5;
 
+// Notes its number and becomes the helper.
+fs::path helperScript() { return fs::temp_directory_path() / ("interrupt." + std::to_string(getpid()) + ".helper"); }
+
 enum Victim { kCommand, kHelper, kBoth, kCommandPolitely };
 
 // One run: `tether watch` saves a camera's pictures, beside them or into another file system, and at the nth event
@@ -62,29 +65,25 @@ class Interruption {
     fs::remove_all(out_);
     fs::remove_all(folder_);
   }
-  Interruption(const Interruption&) = delete;
-  Interruption& operator=(const Interruption&) = delete;
 
  private:
   void start() {
     watch_ = inotify_init1(IN_CLOEXEC | IN_NONBLOCK);
     inotify_add_watch(watch_, out_.c_str(), kEvents);
     inotify_add_watch(watch_, (folder_ / "tmp").c_str(), IN_CREATE);
-    const fs::path helper = folder_ / "helper";
-    std::ofstream(helper) << "#!/bin/sh\necho $$ >>pids\nexec '" TETHER_HELPER "'\n";
-    fs::permissions(helper, fs::perms::owner_all);
     std::string shell = "sh";
     std::string option = "-c";
     std::string script = "cd '" + folder_.string() + "'; TMPDIR=$PWD/tmp TETHER_VIRTUAL_CAMERAS=$PWD/cameras exec '" +
-                         TETHER_COMMAND "' watch --json --helper ./helper --output '" + out_.string() +
-                         "' >out.json 2>err";
+                         TETHER_COMMAND "' watch --json --helper '" + helperScript().string() + "' --output '" +
+                         out_.string() + "' >out.json 2>err";
     char* const words[] = {shell.data(), option.data(), script.data(), nullptr};
     ASSERT_EQ(posix_spawn(&command_, "/bin/sh", nullptr, nullptr, words, environ), 0);
   }
   // Or the end of all there will be.
   void awaitEvent(int left) {
     alignas(inotify_event) char bytes[4096];
-    while (left > 0 && saved() < kPictures) {
+    const auto limit = Clock::now() + std::chrono::minutes(1);
+    while (left > 0 && saved() < kPictures && Clock::now() < limit) {
       pollfd ready{watch_, POLLIN, 0};
       poll(&ready, 1, 100);
       const ssize_t got = read(watch_, bytes, sizeof bytes);
@@ -177,6 +176,9 @@ class Interruption {
 
 TEST(Interrupted, AHundredTimesNoPictureIsLostCutDoubledOrOverwritten) {
   ASSERT_EQ(prctl(PR_SET_CHILD_SUBREAPER, 1), 0);
+  // Before there are threads: a file that is open for writing, in a child just forked too, cannot be executed.
+  std::ofstream(helperScript()) << "#!/bin/sh\necho $$ >>pids\nexec '" TETHER_HELPER "'\n";
+  fs::permissions(helperScript(), fs::perms::owner_all);
   const bool other = access("/dev/shm", W_OK) == 0;
   std::atomic<int> next{0};
   std::vector<std::thread> threads;
@@ -192,6 +194,7 @@ TEST(Interrupted, AHundredTimesNoPictureIsLostCutDoubledOrOverwritten) {
   };
   for (int i = 0; i < kAtOnce; ++i) threads.emplace_back(work);
   for (auto& thread : threads) thread.join();
+  fs::remove(helperScript());
 }
 
 }  // namespace
