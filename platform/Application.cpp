@@ -105,7 +105,8 @@ void Application::terminate() {
 
 int applicationMain(int /*argc*/, char** /*argv*/, const std::function<std::shared_ptr<void>()>& load) {
   fillStandardDescriptors();
-  std::signal(SIGPIPE, SIG_IGN);
+  // A reader that is gone and a limit on file sizes are errors of the write.
+  for (const int number : {SIGPIPE, SIGXFSZ}) std::signal(number, SIG_IGN);
   std::shared_ptr<void> mainInterface;
   try {
     startWatching();

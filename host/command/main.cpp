@@ -41,7 +41,7 @@ void occupyClosedDescriptors() {
 // A signal that whoever started this wants ignored (nohup, a shell's background job) stays ignored.
 void watchSignals(Wakeup& wakeup) {
   signalled = &wakeup;
-  std::signal(SIGPIPE, SIG_IGN);
+  for (const int number : {SIGPIPE, SIGXFSZ}) std::signal(number, SIG_IGN);  // errors of the write
   for (const int number : {SIGINT, SIGTERM, SIGHUP}) {
     struct sigaction before {};
     sigaction(number, nullptr, &before);

@@ -182,12 +182,11 @@ void Helper::runChild(int input, int output) {
   close(errors);
   for (const auto& [name, value] : environment_) setenv(name.c_str(), value.c_str(), 1);
   if (fileLimit_) {
-    std::signal(SIGXFSZ, SIG_IGN);
     const rlimit limit{*fileLimit_, *fileLimit_};
     setrlimit(RLIMIT_FSIZE, &limit);
   }
   setenv("TSAN_OPTIONS", "halt_on_error=1", 0);  // a race is no good end
-  std::signal(SIGPIPE, SIG_DFL);
+  for (const int number : {SIGPIPE, SIGXFSZ}) std::signal(number, SIG_DFL);
   execl(executable().c_str(), executable().c_str(), nullptr);
   _exit(127);
 }

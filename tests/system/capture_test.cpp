@@ -70,5 +70,14 @@ TEST_F(Capture, WorksWithoutAFolderOfCameras) {
   EXPECT_EQ(jpeg.substr(0, 3), "\xff\xd8\xff");
 }
 
+TEST_F(Capture, ALimitOnFileSizesCostsThePicturesAboveItOnly) {
+  helper.limitFileSize(500'000);
+  startWithCamera();
+  drop(studio() / "1.jpg", pattern(1'000'000, 1));
+  helper.await("objectWasAdded");
+  drop(studio() / "2.jpg", pattern(1000, 2));
+  EXPECT_TRUE(readFile(helper.await("fileDownloadComplete").text("file_path")) == pattern(1000, 2));
+}
+
 }  // namespace
 }  // namespace tether

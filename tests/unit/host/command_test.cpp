@@ -9,8 +9,10 @@
 
 namespace {
 
+using fake::camera;
 using fake::Folder;
 using fake::Helper;
+using fake::kAdded;
 using testing::AllOf;
 using testing::ElementsAre;
 using testing::HasSubstr;
@@ -18,16 +20,9 @@ using testing::IsEmpty;
 using Json = nlohmann::json;
 using Texts = std::vector<std::string>;
 
-const std::string kAdded = R"({"send": "deviceAdded", "payload": {"device_id": 257, "name": "Cam"}})";
 const std::string kAnnounced = R"({"send": "objectWasAdded", "payload":
   {"capture_id": 1, "has_sidecar": 0, "file_name": "Capture0001.jpg", "file_size": 2000}})";
 
-// A camera that is there and lets itself be connected; what it does when the shutter is released.
-std::string camera(const std::string& capture) {
-  return R"({"start": [)" + kAdded + R"(], "on": {"connectDevice": [[{"reply": "ok"}]],
-    "getCameraSettings": [[{"reply": "error"}]], "doCapture": )" +
-         capture + "}}";
-}
 // What it does when it is connected.
 std::string connected(const std::string& connect) {
   return R"({"heartbeat": 20, "start": [)" + kAdded + R"(], "on": {"connectDevice": )" + connect + "}}";

@@ -13,13 +13,6 @@ using testing::AllOf;
 using testing::ElementsAre;
 using testing::HasSubstr;
 
-// A camera that is there and lets itself be connected; what it does when the shutter is released.
-std::string camera(const std::string& capture) {
-  return R"({"start": [{"send": "deviceAdded", "payload": {"device_id": 257, "name": "Cam"}}],
-    "on": {"connectDevice": [[{"reply": "ok"}]], "getCameraSettings": [[{"reply": "error"}]], "doCapture": )" +
-         capture + "}}";
-}
-
 // The process ends before or behind the nth call. Renaming fails with an error, but within the folder for EXDEV.
 class Killed : public tether::FileCalls {
   template <typename Call>
@@ -99,7 +92,7 @@ class TetherInterruptionTest : public testing::Test {
 };
 
 TEST_F(TetherInterruptionTest, AStandardOutputThatTakesNothingIsSaidAndIs1AndWhatWasShotIsSaved) {
-  const Helper helper(camera(R"([[{"picture": "a.jpg"}]])"));
+  const Helper helper(fake::camera(R"([[{"picture": "a.jpg"}]])"));
   for (const std::string redirection : {">/dev/full", ">&-"}) {
     EXPECT_EQ(run(helper, "list" + options, redirection), 1);
     EXPECT_THAT(errors(), HasSubstr("tether: cannot write to standard output: "));
@@ -125,7 +118,7 @@ TEST_F(TetherInterruptionTest, APictureThatWasThereBeforeIsSavedAndDoesNotCountA
 TEST_F(TetherInterruptionTest, CaptureStartsAHelperAgainThatDiesWhileItConnects) {
   const Helper helper(R"([{"start": [{"send": "deviceAdded", "payload": {"device_id": 257, "name": "Cam"}}],
     "on": {"getCameraSettings": [[{"reply": "error"}]], "connectDevice": [[{"exit": 9}]]}}, )" +
-                      camera(R"([[{"picture": "a.jpg"}]])") + "]");
+                      fake::camera(R"([[{"picture": "a.jpg"}]])") + "]");
   EXPECT_EQ(run(helper, "capture --output " + out.path() + options, ">/dev/null"), 0) << errors();
   EXPECT_THAT(errors(), HasSubstr("exit status 9); starting it again"));
   EXPECT_THAT(out.names(), ElementsAre("a.jpg"));
