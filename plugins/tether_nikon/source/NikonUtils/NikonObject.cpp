@@ -3,6 +3,8 @@
 #include <algorithm>
 #include <chrono>
 #include <cstdio>
+#include <new>
+#include <set>
 #include <utility>
 
 #include "DebugTrace.h"
@@ -17,6 +19,17 @@ namespace {
 using namespace std::chrono_literals;
 
 constexpr auto kDeletionLockWait = 30s;
+
+// Addresses under which the SDK still knows an object that has gone.
+struct Stranded {
+  std::mutex lock;
+  std::set<const void*> addresses;
+};
+
+Stranded& stranded() {
+  static auto* const all = new Stranded;
+  return *all;
+}
 
 }  // namespace
 
@@ -83,6 +96,11 @@ void CNikonObject::registerCallback(std::int32_t capability, void (*procedure)()
   setCapability(capability, kNkMAIDDataType_CallbackPtr, sdkData(&callback));
 }
 
+bool CNikonObject::unregisterCallback(std::int32_t capability) {
+  const std::int32_t result = setCapability(capability, kNkMAIDDataType_Null, 0);
+  return result == kNkMAIDResult_NoError || result == kNotAnnounced;
+}
+
 // Teardown.
 
 CNikonObject::~CNikonObject() {
@@ -96,12 +114,27 @@ CNikonObject::~CNikonObject() {
   }
   const std::unique_lock guard(gNikonObjectLock, std::adopt_lock);
   platform::log("Thread: %s - Did acquire lock - ACQLOCK - for deleting CNikonObject: 0x%x", thread.c_str(), address);
-  setCapability(kNkMAIDCapability_EventProc, kNkMAIDDataType_Null, 0);
-  setCapability(kNkMAIDCapability_DataProc, kNkMAIDDataType_Null, 0);
+  const bool noEvents = unregisterCallback(kNkMAIDCapability_EventProc);
+  const bool noData = unregisterCallback(kNkMAIDCapability_DataProc);
   deleteChildren();
   closeNikonObject();
+  if (!_closed && !(noEvents && noData)) {
+    const std::lock_guard strandedGuard(stranded().lock);
+    stranded().addresses.insert(this);
+  }
   if (_parent != nullptr) _parent->removeChild(this);
   platform::log("Thread: %s - Releasing lock - ACQLOCK - for deleting CNikonObject: 0x%x", thread.c_str(), address);
+}
+
+// Not inlined: the compiler would take the pair for a mismatched one.
+[[gnu::noinline]] void* CNikonObject::operator new(std::size_t size) { return ::operator new(size); }
+
+void CNikonObject::operator delete(void* memory) {
+  {
+    const std::lock_guard guard(stranded().lock);
+    if (stranded().addresses.count(memory) != 0) return;
+  }
+  ::operator delete(memory);
 }
 
 // Before the lock is taken: a callback inside a descendant, which is waited for, may want the lock itself.
@@ -145,7 +178,7 @@ void CNikonObject::closeNikonObject() {
     const std::lock_guard guard(_stateLock);
     record.swap(_object);
   }
-  if (record) Command_Close(_entryPoint, record.get());
+  if (record) _closed = Command_Close(_entryPoint, record.get());
 }
 
 std::shared_ptr<tagNkMAIDObject> CNikonObject::getObject() const {

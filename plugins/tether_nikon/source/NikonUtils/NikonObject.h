@@ -58,6 +58,10 @@ class CNikonObject : public CNikonCallbackReceiver {
   void eventNotification(std::int32_t event, void* data) override;
   // Deletes the children, closes the object and leaves the parent, all under the deletion lock.
   virtual ~CNikonObject();
+  // The memory of an object that the SDK did not let go of is not used again: what is still called back for it must not
+  // find another object there.
+  static void* operator new(std::size_t size);
+  static void operator delete(void* memory);
 
   // Children. Ids are the SDK's. An entry that is replaced stays the parent's until it is removed.
   void addChild(std::int32_t id, CNikonObject* child);
@@ -126,6 +130,7 @@ class CNikonObject : public CNikonCallbackReceiver {
   void collectGatesBelow(std::vector<std::shared_ptr<CallbackGate>>& gates) const;
   void init(CNikonObject* parentObject, std::int32_t id);
   void registerCallback(std::int32_t capability, void (*procedure)());
+  bool unregisterCallback(std::int32_t capability);
   void deleteChildren();
   CNikonObject* takeNextChild();
   const tagNkMAIDCapInfo* findCapability(std::int32_t capability) const;
@@ -148,6 +153,7 @@ class CNikonObject : public CNikonCallbackReceiver {
   NkMAIDEntryPoint* _entryPoint;
   std::atomic<bool> _inUse{false};
   std::atomic<bool> _waitsAbandoned{false};
+  std::atomic<bool> _closed{false};  // and the SDK said so
   std::shared_ptr<CallbackGate> _gate;
 };
 
