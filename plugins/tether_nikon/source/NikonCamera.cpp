@@ -73,27 +73,39 @@ void CCamera::eventNotification(std::int32_t event, void* data) {
 
 void CCamera::handleNewContainer(std::int32_t itemId) {
   std::unique_ptr<CContentContainer> container;
+  const std::int32_t downloadId = nextDownloadId();
   try {
-    container = std::make_unique<CContentContainer>(this, itemId, _downloadId);
+    container = std::make_unique<CContentContainer>(this, itemId, downloadId);
   } catch (std::int32_t result) {
     debugmsgint("CCamera::handleNewContainer - could not open item, error: %d", result);
     return;
   }
-  if (_rawPlusJpegPending && !container->isRawPlusJPEG()) {
+  number(*container, downloadId);
+  NikonTetherService::getSingleton()->addItemToDownloadQueue(container.release());
+}
+
+std::int32_t CCamera::nextDownloadId() {
+  const std::lock_guard guard(_numberLock);
+  return _downloadId;
+}
+
+void CCamera::number(CContentContainer& container, std::int32_t given) {
+  const std::lock_guard guard(_numberLock);
+  if (_rawPlusJpegPending && !container.isRawPlusJPEG()) {
     // The pair's second file never came: that shot is done, this is another one.
     _rawPlusJpegPending = false;
     ++_downloadId;
-    container->setDownloadId(_downloadId);
   }
+  // An item of another thread may have taken the id meanwhile, too.
+  if (_downloadId != given) container.setDownloadId(_downloadId);
   if (_rawPlusJpegPending) {
     ++_downloadId;
     _rawPlusJpegPending = false;
-  } else if (container->isRawPlusJPEG()) {
+  } else if (container.isRawPlusJPEG()) {
     _rawPlusJpegPending = true;
   } else {
     ++_downloadId;
   }
-  NikonTetherService::getSingleton()->addItemToDownloadQueue(container.release());
 }
 
 std::int32_t CCamera::makeCameraSettingsMessage(KtLuaTETable*& table) {

@@ -1,9 +1,12 @@
 // One camera: a device object opened as a child of its module.
 #pragma once
 
+#include <mutex>
 #include <string>
 
 #include "NikonObject.h"
+
+class CContentContainer;
 
 class CCamera : public CNikonObject {
  public:
@@ -37,10 +40,14 @@ class CCamera : public CNikonObject {
  private:
   void setCamera(std::int32_t cameraId);
   void handleNewContainer(std::int32_t itemId);
+  std::int32_t nextDownloadId();
+  // Gives the item, opened with that id, its final one and counts it.
+  void number(CContentContainer& container, std::int32_t given);
 
   std::string _name;
   std::int32_t _id = 0;
   bool _touched = false;
+  std::mutex _numberLock;            // of these two: a module may announce items on threads of its own
   bool _rawPlusJpegPending = false;  // the first file of a pair has come, its partner not yet
   std::int32_t _downloadId = 1;      // the next item's
 };

@@ -253,7 +253,7 @@ bool CContentData::takeBuffer() {
 }
 
 void CContentData::store(const tagNkMAIDFileInfo& info, const void* data) {
-  if (data == nullptr || endOf(info) > static_cast<std::uint32_t>(_dataSize)) return;
+  if (data == nullptr || info.ulLength == 0 || endOf(info) > static_cast<std::uint32_t>(_dataSize)) return;
   zeroUpTo(info.ulStart);
   std::memcpy(_buffer.data() + info.ulStart, data, info.ulLength);
   _known = std::max(_known, static_cast<std::size_t>(endOf(info)));
