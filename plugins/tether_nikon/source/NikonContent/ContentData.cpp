@@ -91,11 +91,12 @@ const char* extensionOf(std::uint32_t fileDataType) {
 // Answers how much was written. A signal does not end it; that one can interrupt a write some file systems insist on.
 std::size_t writeWhole(const char* bytes, std::size_t size, std::FILE* file) {
   std::size_t written = 0;
-  do {
+  errno = EINTR;
+  while (written < size && errno == EINTR) {
     errno = 0;
     std::clearerr(file);
     written += std::fwrite(bytes + written, 1, size - written, file);
-  } while (written < size && errno == EINTR);
+  }
   return written;
 }
 
