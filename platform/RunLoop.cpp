@@ -86,6 +86,8 @@ const std::shared_ptr<RunLoop>& RunLoop::current() {
   return threadLoop;
 }
 
+std::shared_ptr<RunLoop> RunLoop::make() { return std::shared_ptr<RunLoop>(new RunLoop); }
+
 void RunLoop::setCurrent(std::shared_ptr<RunLoop> loop) { threadLoop = std::move(loop); }
 
 void RunLoop::endCurrent() {

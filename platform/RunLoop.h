@@ -42,7 +42,7 @@ class RunLoop : public std::enable_shared_from_this<RunLoop> {
   static void endCurrent();
   // A loop for a thread that is about to be started, which makes it its own before it asks for current(). Throws
   // std::system_error when the system has no descriptors left; current() does so for a loop that it has to make.
-  static std::shared_ptr<RunLoop> make() { return std::shared_ptr<RunLoop>(new RunLoop); }
+  static std::shared_ptr<RunLoop> make();
   static void setCurrent(std::shared_ptr<RunLoop> loop);
 
   RunLoop(const RunLoop&) = delete;
