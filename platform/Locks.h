@@ -6,6 +6,7 @@
 // They are built from a mutex and a condition, which every sanitizer understands, unlike the system's timed mutexes.
 #pragma once
 
+#include <atomic>
 #include <chrono>
 #include <condition_variable>
 #include <mutex>
@@ -16,27 +17,36 @@ namespace platform {
 class TimedLock {
  public:
   void lock() {
+    if (take()) return;
     std::unique_lock guard(_state);
-    _freed.wait(guard, [this] { return !_taken; });
-    _taken = true;
+    ++_waiting;
+    _freed.wait(guard, [this] { return take(); });
+    --_waiting;
   }
   template <typename Duration>
   bool try_lock_for(Duration wait) {
+    if (take()) return true;
     std::unique_lock guard(_state);
-    // A free lock is had without a look at the clock.
-    if (_taken && !_freed.wait_for(guard, wait, [this] { return !_taken; })) return false;
-    return _taken = true;
+    ++_waiting;
+    const bool taken = _freed.wait_for(guard, wait, [this] { return take(); });
+    --_waiting;
+    return taken;
   }
   void unlock() {
-    std::lock_guard guard(_state);
     _taken = false;
+    // Who began to wait before is seen here, and who begins now sees it free.
+    if (_waiting == 0) return;
+    std::lock_guard guard(_state);
     _freed.notify_one();
   }
 
  private:
+  bool take() { return !_taken.exchange(true); }
+
   std::mutex _state;
   std::condition_variable _freed;
-  bool _taken = false;
+  std::atomic<bool> _taken{false};
+  std::atomic<int> _waiting{0};
 };
 
 // May be taken again by the thread that holds it; free once it was given back as often.

@@ -88,6 +88,18 @@ struct ltalte {
   bool operator()(const KtLuaTE* a, const KtLuaTE* b) const { return *a < *b; }
 };
 
+// Gives a table its own memory from where its elements have theirs.
+template <typename T>
+struct KtLuaAllocator {
+  using value_type = T;
+  KtLuaAllocator() = default;
+  template <typename Other>
+  explicit(false) KtLuaAllocator(const KtLuaAllocator<Other>& /*other*/) {}
+  T* allocate(std::size_t count) { return static_cast<T*>(KtLuaTE::operator new(count * sizeof(T))); }
+  void deallocate(T* memory, std::size_t count) noexcept { KtLuaTE::operator delete(memory, count * sizeof(T)); }
+  bool operator==(const KtLuaAllocator&) const = default;
+};
+
 class KtLuaTENil final : public KtLuaTE {
  public:
   KtLuaTENil() : KtLuaTE(kKtLuaTypeNil) {}
@@ -147,7 +159,7 @@ class KtLuaTEData final : public KtLuaTE {
 
 class KtLuaTETable final : public KtLuaTE {
  public:
-  using Entries = std::map<KtLuaTE*, KtLuaTE*, ltalte>;
+  using Entries = std::map<KtLuaTE*, KtLuaTE*, ltalte, KtLuaAllocator<std::pair<KtLuaTE* const, KtLuaTE*>>>;
 
   KtLuaTETable() : KtLuaTE(kKtLuaTypeTable) {}
   explicit KtLuaTETable(std::istream& in);
