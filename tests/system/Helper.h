@@ -117,6 +117,7 @@ class Helper {
 // Waits for what no message tells, a file for instance.
 void awaitCondition(const std::string& what, const std::function<bool()>& condition);
 
+// Another one for every seed but 0.
 std::string pattern(std::size_t size, unsigned seed);
 std::string readFile(const std::filesystem::path& path);
 // The file appears whole: written under a hidden name, dated back, renamed.

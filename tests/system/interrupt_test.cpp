@@ -52,7 +52,7 @@ class Interruption {
     const fs::path camera = folder_ / "cameras/1-Studio";
     drop(camera / "camera.json", R"({"transfer": {"deliveryBytes": 20000, "bytesPerSecond": 5000000}})");
     for (int i = 0; i < kPictures; ++i) {
-      sources_.push_back(pattern(150'000, static_cast<unsigned>(number * kPictures + i)));
+      sources_.push_back(pattern(150'000, static_cast<unsigned>(number * kPictures + i + 1)));
       drop(camera / (std::to_string(i) + ".jpg"), sources_.back());
     }
     start();

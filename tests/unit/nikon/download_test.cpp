@@ -78,9 +78,9 @@ TEST_F(DownloadThreadTest, ACallbackOnItsWayWhenTheObjectIsDeletedThereFindsNoth
     delete object;  // the delivering thread is waiting for this one
   }));
   std::promise<void> started;
-  auto deliverer = std::async(std::launch::async, [&] {
+  auto deliverer = std::async(std::launch::async, [&started, reference = object->reference()] {
     started.set_value();
-    return MAIDDataHandler(object->reference(), nullptr, nullptr);
+    return MAIDDataHandler(reference, nullptr, nullptr);
   });
   started.get_future().wait();
   mayGoOn.set_value();
@@ -179,6 +179,33 @@ TEST_F(ServiceTest, DeliveriesOnOtherThreadsReachADataObjectThatOpenedLate) {
   for (int shot = 0; shot < 40; ++shot) camera.shoot(Picture::jpeg(bytes(995, shot)));
   idleUntil("fileDownloadComplete", 40);
   EXPECT_EQ(read(recorder.await("fileDownloadComplete", 40).strings.at("file_path")), bytes(995, 39));
+}
+
+// A module may take seconds for a poll: on the main thread, while a picture comes in on the other; then there.
+TEST_F(ServiceTest, APollThatDoesNotReturnHoldsUpItsOwnThreadOnly) {
+  model.addCamera(1, "One").setTransfer({.deliveryBytes = 100, .pollsPerDelivery = 10});
+  start();
+  model.camera(1)->shoot(Picture::jpeg(bytes(10000)));
+  idleUntil("objectWasAdded");
+  model.faults().add({.level = Level::Module, .command = kNkMAIDCommand_Async, .times = 1, .delay = 1h});
+  auto release = std::async(std::launch::async, [this] {
+    recorder.await("fileDownloadComplete");
+    model.faults().release();
+  });
+  idle();
+  release.get();
+
+  model.faults().add({.level = Level::Data, .command = kNkMAIDCommand_Async, .skip = 15, .times = 1, .delay = 1h});
+  model.camera(1)->shoot(Picture::jpeg(bytes(1000)));
+  idleUntil("objectWasAdded", 2);
+  model.addCamera(2, "Two");
+  idleUntil("deviceAdded", 2);
+  connect(7, 2);
+  askSettings(8, kModuleId | 2);  // not to be had during a transfer
+  EXPECT_NE(recorder.names().find("ok#7"), std::string::npos);
+  EXPECT_EQ(recorder.names().find("#8"), std::string::npos);
+  model.faults().release();
+  EXPECT_EQ(read(idleUntil("fileDownloadComplete", 2).strings.at("file_path")), bytes(1000));
 }
 
 TEST_F(ServiceTest, TheEndOfTheServiceWaitsForTheTransferAndGivesTheQueueUp) {
