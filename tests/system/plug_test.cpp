@@ -52,35 +52,6 @@ TEST_F(Plug, EveryCameraIsAnnouncedOnceWhenItComesAndOnceWhenItGoes) {
   EXPECT_EQ(helper.count("deviceRemoved"), 2U);
 }
 
-TEST_F(Plug, ACameraUnpluggedInTheMiddleOfATransferWithMoreQueuedTakesNothingWithIt) {
-  startWithCamera(R"({"transfer": {"deliveryBytes": 1000, "bytesPerSecond": 1000}})");
-  connect(kStudio);
-  for (const char* name : {"1.jpg", "2.jpg", "3.jpg"}) drop(studio() / name, pattern(1'000'000, 1));
-  helper.await("objectWasAdded");
-  // While it lasts, settings are not to be had; cameras can still be connected.
-  helper.send(request("getCameraSettings", 2, kStudio) + request("connectDevice", 3, 0x0109));
-  EXPECT_EQ(helper.awaitAnswer(3).name, "error");
-  connect(kStudio);
-  unplug("1-Studio");
-  expectNext("deviceRemoved", kStudio);
-  expectNoCameraConnected(4);
-  helper.await("heartbeat");
-  EXPECT_EQ(helper.count("objectWasAdded"), 1U);
-  EXPECT_EQ(helper.count("fileDownloadComplete"), 0U);
-  for (const Message& message : helper.messages()) EXPECT_NE(message.id, 2);
-
-  // It comes back faster, and with its pictures.
-  drop(helper.folder() / "drawer/1-Studio/camera.json", "{}");
-  plugIn("1-Studio");
-  expectNext("deviceAdded", kStudio);
-  for (int i = 0; i < 3; ++i) {
-    EXPECT_TRUE(readFile(helper.await("fileDownloadComplete").text("file_path")) == pattern(1'000'000, 1));
-  }
-  helper.settle();
-  EXPECT_EQ(helper.count("deviceAdded"), 2U);
-  EXPECT_EQ(helper.count("deviceRemoved"), 1U);
-}
-
 TEST_F(Plug, ComingAndGoingLeavesNoDescriptorAndNoThreadBehind) {
   if (!fs::exists("/proc/self/task")) GTEST_SKIP() << "no processes to look into";
   startWithCamera();

@@ -139,16 +139,6 @@ TEST_F(FrameReader, AFrameAboveTheLimitIsSkippedAsItArrivesWithoutBeingStored) {
   EXPECT_LT(largest, 100U);
 }
 
-TEST_F(FrameReader, AReaderThatWaitsInsideAFrameDoesNotDecodeItAgainForEveryByte) {
-  // The length field is far too small, so decoding begins with the first bytes of a large data element.
-  const std::int32_t size = 200000;
-  const std::string bytes = frame(1, kName + raw(kKtLuaTypeData) + raw(size) + std::string(size, 'd'), -size);
-  feed(bytes.substr(0, 30));
-  EXPECT_EQ(reader->currentMessageStage(), 3);
-  feedInChunksOf(1000, bytes.substr(30));
-  EXPECT_EQ(takeIds(), (std::vector<std::int32_t>{1}));
-}
-
 TEST_F(FrameReader, TheEndOfTheInputIsToldOnceAndQueuedMessagesStay) {
   feed(kHeartbeat);
   writing.reset();

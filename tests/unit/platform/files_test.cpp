@@ -77,26 +77,6 @@ TEST(FileHandle, WritesFromTwoThreadsStayWholeThroughAFullNonBlockingPipeAndFail
   EXPECT_EQ(pipe.writing->write("x", 1), EPIPE);
 }
 
-TEST(Paths, AreTakenApartAndJoined) {
-  using namespace platform;
-  const struct {
-    std::string path, folder, name, extension, without;
-  } table[] = {{"/a/b.c", "/a", "b.c", "c", "/a/b"},
-               {"/b", "/", "b", "", "/b"},
-               {"x.tar.gz", "", "x.tar.gz", "gz", "x.tar"},
-               {"/a.d/b", "/a.d", "b", "", "/a.d/b"},
-               {"/a/.hidden", "/a", ".hidden", "", "/a/.hidden"}};
-  for (const auto& row : table) {
-    EXPECT_EQ(deletingLastPathComponent(row.path), row.folder);
-    EXPECT_EQ(lastPathComponent(row.path), row.name);
-    EXPECT_EQ(pathExtension(row.path), row.extension);
-    EXPECT_EQ(deletingPathExtension(row.path), row.without);
-  }
-  EXPECT_EQ(appendingPathComponent("/", "b"), "/b");
-  EXPECT_EQ(appendingPathComponent("/a/", "b"), "/a/b");
-  EXPECT_EQ(appendingPathComponent("", "b"), "b");
-}
-
 class InFolder : public ::testing::Test {
  protected:
   ~InFolder() override { std::filesystem::remove_all(folder); }

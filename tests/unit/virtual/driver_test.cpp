@@ -157,14 +157,11 @@ TEST_F(DriverTest, TheCameraFileIsReadAgainWhenItChangesAndKeptWhenItIsWrong) {
   EXPECT_TRUE(comesTrue([&] { return battery() == 85; }));
 }
 
-TEST(CameraFileTest, ReadsEverySettingTypeShorthandAndFault) {
+TEST(CameraFileTest, ReadsSettingsByTypeAndShorthandAndFaults) {
   const CameraFile file = parseCameraFile(R"({
-    "alive": false,
-    "transfer": {"deliveryBytes": 4096, "bytesPerSecond": 1000000, "inModulePolls": true},
-    "capture": {"polls": 3, "answer": "NoError"},
-    "fileTypes": {".XYZ": 99},
-    "settings": {
-      "Aperture": "f/8", "Sensitivity": 800, "ExposureMode": 1, "FreeBytes": null, "SaveMedia": 1,
+    "transfer": {"deliveryBytes": 4096, "inModulePolls": true}, "capture": {"polls": 3, "answer": "NoError"},
+    "fileTypes": {".XYZ": 99}, "alive": false,
+    "settings": {"Aperture": "f/8", "FreeBytes": null, "SaveMedia": 1,
       "WBMode": {"type": "strings", "values": ["Auto", "Shade"], "current": 5},
       "0x9001": {"type": "integer", "value": -3}, "36866": {"type": 4},
       "0x9003": {"type": "boolean", "value": true}, "0x9004": {"type": "integers"}},
@@ -179,8 +176,6 @@ TEST(CameraFileTest, ReadsEverySettingTypeShorthandAndFault) {
     return *std::find_if(file.settings.begin(), file.settings.end(), [id](const auto& s) { return s.id == id; });
   };
   EXPECT_EQ(std::get<Enumeration>(setting(kNkMAIDCapability_Aperture).value).current, 4u);
-  EXPECT_EQ(std::get<Enumeration>(setting(kNkMAIDCapability_Sensitivity).value).current, 3u);
-  EXPECT_EQ(std::get<Enumeration>(setting(kNkMAIDCapability_ExposureMode).value).current, 1u);
   for (const Capability& expected :
        {Capability::strings(kNkMAIDCapability_WBMode, {"Auto", "Shade"}, 5),
         Capability::unsignedInteger(kNkMAIDCapability_SaveMedia, 1), Capability::integer(0x9001, -3),
@@ -188,8 +183,7 @@ TEST(CameraFileTest, ReadsEverySettingTypeShorthandAndFault) {
     EXPECT_EQ(setting(expected.id), expected);
   EXPECT_EQ(file.withoutCapabilities, (Ids{kNkMAIDCapability_FreeBytes}));
   EXPECT_TRUE(file.transfer.deliveryBytes == 4096 && file.transfer.inModulePolls);
-  EXPECT_EQ(file.capture.answer, kNkMAIDResult_NoError);
-  EXPECT_EQ(file.fileTypes.at(".xyz"), 99u);
+  EXPECT_TRUE(file.capture.answer == kNkMAIDResult_NoError && file.fileTypes.at(".xyz") == 99);
 
   ASSERT_EQ(file.faults.size(), 3u);
   EXPECT_EQ(file.faults[0].camera, std::nullopt);

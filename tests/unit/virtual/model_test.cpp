@@ -119,22 +119,6 @@ TEST_F(ModelTest, CompletionsStayAwayComeLateTwiceOrAfterTheClose) {
   }
 }
 
-TEST_F(ModelTest, AfterAnUnplugFromInsideADeliveryAllObjectsOfTheCameraAreGone) {
-  camera.setTransfer({.deliveryBytes = 10});
-  camera.shoot(Picture::pattern(kNkMAIDFileDataType_JPEG, 100));
-  Opened open(device, 1);
-  open.data.inCallback = [this] { model.removeCamera(1); };
-  open.data.start(kNkMAIDCapability_Acquire);
-  EXPECT_EQ(open.data.finish(), kNkMAIDResult_ZombieObject);
-  EXPECT_TRUE(open.data.deliveries.size() == 1 && open.data.completions.empty());
-  EXPECT_EQ(open.item.poll(), kNkMAIDResult_ZombieObject);
-  model.addCamera(1, "One again");
-  EXPECT_EQ(device.name(), "!");  // the new camera is another
-  EXPECT_EQ(Client(module, 1).name(), "One again");
-  module.poll();
-  EXPECT_EQ(module.events, (Client::Events{{kNkMAIDEvent_RemoveChild, 1}, {kNkMAIDEvent_AddChild, 1}}));
-}
-
 TEST_F(ModelTest, CamerasGoWhileOneThreadPollsTheModuleAndAnotherTransfers) {
   device.close();
   std::atomic<bool> ended{false};
