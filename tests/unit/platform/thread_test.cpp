@@ -37,6 +37,21 @@ TEST(Locks, AreHadWithinTheWaitOrNotAtAll) {
   }).get();
 }
 
+TEST(Locks, AreHandedOnToWhoeverWaits) {
+  platform::TimedLock lock;
+  int turns = 0;
+  const auto take = [&] {
+    for (int turn = 0; turn < 20'000; ++turn) {
+      const std::lock_guard guard(lock);
+      ++turns;
+    }
+  };
+  std::thread other(take);
+  take();
+  other.join();
+  EXPECT_EQ(turns, 40'000);
+}
+
 TEST(Notifications, ReachObserversByNameAndObjectUntilTheirTokenGoes) {
   NotificationCenter center;
   int object = 0;
