@@ -1,10 +1,12 @@
 #include "FileManager.h"
 
 #include <dirent.h>
+#include <sys/resource.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
+#include <cerrno>
 #include <cstdlib>
 #include <memory>
 
@@ -21,6 +23,13 @@ bool FileManager::isDirectory(const std::string& path) {
 }
 
 bool FileManager::remove(const std::string& path) { return unlink(path.c_str()) == 0; }
+
+int FileManager::reserve(int file, std::uint64_t bytes) {
+  rlimit limit{};
+  if (getrlimit(RLIMIT_FSIZE, &limit) == 0 && bytes > limit.rlim_cur) return EFBIG;
+  const int error = keepRoom(file, bytes);
+  return error == ENOSPC || error == EDQUOT || error == EFBIG ? error : 0;
+}
 
 std::vector<std::string> FileManager::contents(const std::string& directory) {
   std::vector<std::string> names;

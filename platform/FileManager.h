@@ -16,10 +16,14 @@ class FileManager {
   // Removes a file. False when it is still there or never was.
   static bool remove(const std::string& path);
   // Keeps room on the disk for that many bytes of an open file, whose size stays. 0, or the error where there is not
-  // as much room; a file system that cannot keep any answers 0 too.
+  // as much room or the process may not write as much; a file system that cannot keep any answers 0 too.
   static int reserve(int file, std::uint64_t bytes);
   // Names in a directory without "." and "..", sorted; none when it cannot be read.
   static std::vector<std::string> contents(const std::string& directory);
+
+ private:
+  // 0, or any error.
+  static int keepRoom(int file, std::uint64_t bytes);
 };
 
 // The directory for files that others take away: TMPDIR where it names a directory, else the system's. No slash at the

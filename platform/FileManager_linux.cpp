@@ -6,12 +6,12 @@
 
 namespace platform {
 
-int FileManager::reserve(int file, std::uint64_t bytes) {
+int FileManager::keepRoom(int file, std::uint64_t bytes) {
   int result = 0;
   do {
     result = fallocate(file, FALLOC_FL_KEEP_SIZE, 0, static_cast<off_t>(bytes));
   } while (result != 0 && errno == EINTR);
-  return result != 0 && (errno == ENOSPC || errno == EDQUOT || errno == EFBIG) ? errno : 0;
+  return result == 0 ? 0 : errno;
 }
 
 }  // namespace platform
