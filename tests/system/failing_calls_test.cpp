@@ -4,6 +4,7 @@
 #include <iterator>
 #include <list>
 #include <map>
+#include <ostream>
 #include <set>
 #include <stdexcept>
 #include <string>
@@ -23,6 +24,8 @@ struct Failure {
   bool losesAPicture = false;
   bool losesTheHost = false;
 };
+
+void PrintTo(const Failure& failure, std::ostream* out) { *out << failure.name; }
 
 const Failure kOnTheRoad[] = {
     {"OpenNoSpace", "open", ENOSPC, true},   {"OpenInterrupted", "open", EINTR},
