@@ -14,6 +14,7 @@
 
 namespace platform {
 
+// Must outlive every call on it, unlock() included: the lock is free before that returns.
 class TimedLock {
  public:
   void lock() {
