@@ -21,6 +21,8 @@ constexpr auto kIdleDelay = 0.1s;
 constexpr auto kDispatchDelay = 0.1s;
 constexpr std::size_t kFrameToKeep = 64 * 1024;  // the memory of a longer one is given back with the next
 
+constexpr std::string_view kShutdown = "shutdown";
+
 struct Request {
   std::string_view name;
   void (NikonTetherService::*operation)(int id, KtLuaTE* data);  // null: known, but nothing is done
@@ -62,7 +64,13 @@ void SendMessageToClient(long id, const char* name, KtLuaTETable* data) {
 
 TetherTask::TetherTask() = default;
 
-TetherTask::~TetherTask() = default;
+TetherTask::~TetherTask() {
+  _accumulatorObserver.remove();
+  _messageAccumulator.reset();
+  _inputFileHandle.reset();
+  _tetherService.reset();  // it may send until it is gone
+  _timer.invalidate();
+}
 
 void TetherTask::awakeFromNib() {
   gTetherTask = this;
@@ -91,7 +99,9 @@ void TetherTask::notificationFromAccumulator(const platform::Notification& notif
       if (!alive.expired()) dispatchMessages();
     });
   } else if (notification.name == kReadHandleIsFinished) {
-    platform::Application::shared().terminate();
+    // A host may close the pipe as soon as it has asked for the end.
+    if (!_messageAccumulator->hasWaiting(kShutdown)) platform::Application::shared().terminate();
+    platform::Application::shared().ignoreEndOfInput();
   }
 }
 
@@ -107,7 +117,8 @@ void TetherTask::dispatchMessage(CRCMessage* message) {
     carryOut(request, *_tetherService, *message);
     return;
   }
-  if (name == "shutdown") {
+  if (name == kShutdown) {
+    platform::Application::shared().ignoreEndOfInput();
     _tetherService.reset();
     platform::Application::shared().terminate();
   }
@@ -136,28 +147,33 @@ void TetherTask::sendHeartbeat() { sendMessage(KtLuaTEString("heartbeat"), 0, nu
 
 // Frames out.
 
-void TetherTask::luaTableElementToNSData(const KtLuaTE& element) { element.writeToStream(_frameStream); }
+const platform::Data& TetherTask::luaTableElementToNSData(const KtLuaTE* element) {
+  platform::MutableData& bytes = _encoding.bytes();
+  if (bytes.capacity() > kFrameToKeep) bytes.release();
+  bytes.clear();
+  element->writeToStream(_encodingStream);
+  return bytes;
+}
 
 void TetherTask::sendMessage(const KtLuaTEString& name, std::int32_t id, const KtLuaTETable* data) {
-  const std::lock_guard guard(_frameLock);
+  const platform::Guard guard(_frameLock);
   if (_hostIsGone) return;
-  platform::MutableData& frame = _frame.bytes();
-  if (frame.capacity() > kFrameToKeep) frame.release();
-  frame.clear();
+  if (_frame.capacity() > kFrameToKeep) _frame.release();
+  _frame.clear();
   std::int32_t length = 0;
-  frame.append(reinterpret_cast<const char*>(&length), sizeof length);
-  frame.append(reinterpret_cast<const char*>(&id), sizeof id);
-  luaTableElementToNSData(name);
-  if (data != nullptr) {
-    luaTableElementToNSData(*data);
-  } else {
-    luaTableElementToNSData(KtLuaTENil());
+  _frame.append(reinterpret_cast<const char*>(&length), sizeof length);
+  _frame.append(reinterpret_cast<const char*>(&id), sizeof id);
+  const KtLuaTENil nothing;
+  const KtLuaTE* const payload = data != nullptr ? static_cast<const KtLuaTE*>(data) : &nothing;
+  for (const KtLuaTE* const element : {static_cast<const KtLuaTE*>(&name), payload}) {
+    const platform::Data& bytes = luaTableElementToNSData(element);
+    _frame.append(bytes.bytes(), bytes.length());
   }
-  length = static_cast<std::int32_t>(frame.length() - sizeof length);
-  frame.replace(0, reinterpret_cast<const char*>(&length), sizeof length);
+  length = static_cast<std::int32_t>(_frame.length() - sizeof length);
+  _frame.replace(0, reinterpret_cast<const char*>(&length), sizeof length);
 
   // One write for the whole frame, so that nothing comes between its parts.
-  const int error = _outputFileHandle->write(frame.bytes(), frame.length());
+  const int error = _outputFileHandle->write(_frame.bytes(), _frame.length());
   if (error == 0 || error == ECANCELED) return;
   _hostIsGone = true;
   platform::log("Writing to the host failed, no more is written: %s", std::strerror(error));

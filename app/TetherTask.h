@@ -6,13 +6,13 @@
 
 #include <cstdint>
 #include <memory>
-#include <mutex>
 #include <ostream>
 
 #include "FileHandle.h"
 #include "KtLuaTableMarshalling.h"
 #include "KtNSDataStreamBuf.h"
 #include "KtRCMessageAccumulator.h"
+#include "Locks.h"
 #include "NotificationCenter.h"
 #include "RunLoop.h"
 
@@ -27,7 +27,6 @@ class TetherTaskStatus {
   ~TetherTaskStatus() { inProgress = false; }
   static bool IsInProgress() { return inProgress; }
 
- private:
   static bool inProgress;
 };
 
@@ -47,8 +46,8 @@ class TetherTask {
   void sendMessage(const KtLuaTEString& name, std::int32_t id, const KtLuaTETable* data);
 
  private:
-  // Appends the element's encoding to the frame that is being made.
-  void luaTableElementToNSData(const KtLuaTE& element);
+  // The element's encoding, valid until the next call.
+  const platform::Data& luaTableElementToNSData(const KtLuaTE* element) REQUIRES(_frameLock);
   void notificationFromAccumulator(const platform::Notification& notification);
   void dispatchMessages();
   void dispatchMessage(CRCMessage* message);
@@ -68,12 +67,12 @@ class TetherTask {
   platform::Observer _accumulatorObserver;
   platform::Observer _terminateObserver;
   platform::Observer _wakeObserver;
-  std::mutex _frameLock;
-  // The frame that is being sent, and the memory for the next one. A stream is kept too: making one costs more than
-  // encoding most frames.
-  KtNSDataWriteStreamBuf _frame;
-  std::ostream _frameStream{&_frame};
-  bool _hostIsGone = false;
+  platform::Mutex _frameLock;
+  platform::MutableData _frame GUARDED_BY(_frameLock);  // that is being sent, and the memory for the next one
+  // A stream is kept: making one costs more than encoding most elements.
+  KtNSDataWriteStreamBuf _encoding GUARDED_BY(_frameLock);
+  std::ostream _encodingStream GUARDED_BY(_frameLock){&_encoding};
+  bool _hostIsGone GUARDED_BY(_frameLock) = false;
   std::shared_ptr<int> _alive = std::make_shared<int>();  // deferred dispatches look whether the task is still there
 };
 

@@ -138,6 +138,14 @@ void HelperProcess::await(const std::string& name) {
   }
 }
 
+void HelperProcess::send(const std::string& bytes) {
+  for (std::size_t sent = 0; sent < bytes.size();) {
+    const ssize_t count = write(_input, bytes.data() + sent, bytes.size() - sent);
+    if (count < 0 && errno != EINTR) throw std::runtime_error("the helper has ended");
+    if (count > 0) sent += static_cast<std::size_t>(count);
+  }
+}
+
 double HelperProcess::memory() const { return statusOf("/proc/" + std::to_string(_process), "VmRSS:") * 1024; }
 
 double HelperProcess::peakMemory() const { return statusOf("/proc/" + std::to_string(_process), "VmHWM:") * 1024; }

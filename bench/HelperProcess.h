@@ -40,6 +40,8 @@ class HelperProcess {
 
   // Reads frames up to the next one of that name. Throws std::runtime_error when the helper ends before.
   void await(const std::string& name);
+  // Writes bytes to its input. Throws std::runtime_error when it has ended.
+  void send(const std::string& bytes);
 
   pid_t process() const { return _process; }
   // Resident memory, now and the most that it has had at a time, in bytes.

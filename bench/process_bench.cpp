@@ -13,6 +13,8 @@
 #include <vector>
 
 #include "HelperProcess.h"
+#include "KtLuaTableMarshalling.h"
+#include "KtNSDataStreamBuf.h"
 #include "MAID.h"
 #include "Measure.h"
 #include "Suites.h"
@@ -28,6 +30,9 @@ constexpr double kIdleLimit = 0.01;
 constexpr auto kSettled = 2s;  // behind the first idle pass
 constexpr auto kIdleTime = 10s;
 constexpr double kIdleSeconds = 10;
+constexpr std::size_t kSmallRequests = std::size_t{6} << 20;
+constexpr std::size_t kSentBefore = std::size_t{100} << 20;
+constexpr double kNoCamera = 0x01FF;
 constexpr int kSleeperWait = 77;  // milliseconds: about as often as the helper, which is made up for
 
 double since(Clock::time_point start) { return std::chrono::duration<double>(Clock::now() - start).count(); }
@@ -150,6 +155,47 @@ void addCameras(Report& report) {
   }
 }
 
+std::string request(const char* name, const KtLuaTE& payload) {
+  KtNSDataWriteStreamBuf buffer;
+  std::ostream out(&buffer);
+  KtLuaTEString(name).writeToStream(out);
+  payload.writeToStream(out);
+  const std::int32_t id = 1;
+  const auto length = static_cast<std::int32_t>(sizeof id + buffer.getNSData()->length());
+  return std::string(reinterpret_cast<const char*>(&length), sizeof length) +
+         std::string(reinterpret_cast<const char*>(&id), sizeof id) +
+         std::string(buffer.getNSData()->bytes(), buffer.getNSData()->length());
+}
+
+// 6 MiB of requests that nothing is done for, and one that is answered.
+std::string smallRequests() {
+  std::string all;
+  while (all.size() < kSmallRequests) all += request("getDeviceInfo", KtLuaTENil());
+  KtLuaTETable nobody;
+  nobody.Set("device_id", new KtLuaTENumber(kNoCamera));
+  return all + request("connectDevice", nobody);
+}
+
+void addRequests(Report& report) {
+  const std::string requests = smallRequests();
+  std::vector<double> first;
+  std::vector<double> later;
+  for (int turn = 0; turn < 5; ++turn) {
+    HelperProcess helper(BENCH_HELPER_WITH_PICTURES, {"TETHER_BENCH_CAMERAS=1"});
+    helper.await("deviceAdded");
+    const auto answered = [&] {
+      const auto begin = Clock::now();
+      helper.send(requests);
+      helper.await("error");
+      return since(begin);
+    };
+    first.push_back(answered());
+    for (std::size_t sent = 0; sent < kSentBefore; sent += requests.size()) answered();
+    later.push_back(answered());
+  }
+  report.add({"6 MiB of small requests after 100 MiB / at first", median(later), median(first), Unit::seconds, 1.2});
+}
+
 }  // namespace
 
 void measureProcesses(Report& report) {
@@ -178,5 +224,6 @@ void measureProcesses(Report& report) {
               Unit::seconds, 1.3});
   report.add(
       {"idle with 17 modules of 10 cameras / 17 times one", middle(all, &Idle::ours), 17 * ours, Unit::seconds, 1.0});
+  addRequests(report);
   addCameras(report);
 }

@@ -63,10 +63,20 @@ void setSignalMask(int how) {
 void watchForTheEnd(int signals, RunLoop& mainLoop) {
   setSignalMask(SIG_UNBLOCK);
   std::array<pollfd, 2> watched{{{signals, POLLIN, 0}, {STDIN_FILENO, 0, 0}}};
-  while (poll(watched.data(), watched.size(), -1) < 0 && errno == EINTR) {
+  const auto wait = [&](std::chrono::milliseconds time) {
+    for (pollfd& each : watched) each.revents = 0;
+    while (poll(watched.data(), watched.size(), static_cast<int>(time.count())) < 0 && errno == EINTR) {
+    }
+    return watched[0].revents != 0;
+  };
+  bool signalled = wait(-1ms);
+  watched[1].fd = -1;
+  if (!signalled) signalled = wait(kMainThreadWait);
+  if (!signalled && Application::shared().ignoresEndOfInput()) signalled = wait(-1ms);
+  if (signalled) {
+    mainLoop.post([] { Application::shared().terminate(); });
+    std::this_thread::sleep_for(kMainThreadWait);
   }
-  if (watched[0].revents != 0) mainLoop.post([] { Application::shared().terminate(); });
-  std::this_thread::sleep_for(kMainThreadWait);
   Application::shared().terminate();
 }
 

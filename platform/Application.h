@@ -1,6 +1,7 @@
 // The process: started once, ended in one place.
 #pragma once
 
+#include <atomic>
 #include <functional>
 #include <memory>
 
@@ -18,8 +19,15 @@ class Application {
   // its place, within two seconds of the signal or of the end of the standard input: observers may be called there.
   [[noreturn]] void terminate();
 
+  // From now on the end of the standard input ends nothing: the process is on its way to terminate() already, and may
+  // take its time. Signals still end it. Any thread.
+  void ignoreEndOfInput() { _ignoresEndOfInput = true; }
+  bool ignoresEndOfInput() const { return _ignoresEndOfInput; }
+
  private:
   Application() = default;
+
+  std::atomic<bool> _ignoresEndOfInput{false};
 };
 
 // Turns the calling thread into the application's main thread: makes the main interface with `load`, keeps it, and runs

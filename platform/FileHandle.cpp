@@ -59,13 +59,13 @@ void FileHandle::readNow() {
 
 void FileHandle::finishWriting(Clock::duration wait) {
   _writingIsOver = true;
-  const std::unique_lock guard(_writeLock, wait);
+  if (_writeLock.try_lock_for(wait)) _writeLock.unlock();
 }
 
 int FileHandle::write(const char* bytes, std::size_t count) {
   // Looked at before the lock, which a thread that writes on and on would hardly let go of otherwise, and under it.
   if (_writingIsOver) return ECANCELED;
-  std::lock_guard guard(_writeLock);
+  const Guard guard(_writeLock);
   if (_writingIsOver) return ECANCELED;
   while (count > 0) {
     const ssize_t written = ::write(_descriptor, bytes, std::min(count, kLargestWrite));

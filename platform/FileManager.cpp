@@ -8,7 +8,10 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstdlib>
+#include <cstring>
 #include <memory>
+
+#include "Log.h"
 
 namespace platform {
 
@@ -43,16 +46,32 @@ std::vector<std::string> FileManager::contents(const std::string& directory) {
   return names;
 }
 
+namespace {
+
+// 0, or why it is no directory.
+int unusable(const char* directory) {
+  struct stat status {};
+  if (stat(directory, &status) != 0) return errno;
+  return S_ISDIR(status.st_mode) ? 0 : ENOTDIR;
+}
+
+}  // namespace
+
 std::string temporaryDirectory() {
   std::string directory = "/tmp";
   const char* const named = std::getenv("TMPDIR");
-  if (named != nullptr && FileManager::isDirectory(named)) directory = named;
+  const bool isNamed = named != nullptr && *named != '\0';
+  const int error = isNamed ? unusable(named) : 0;
+  if (isNamed && error == 0) directory = named;
 #if defined(__APPLE__)
   char users[1024];
   const size_t length = confstr(_CS_DARWIN_USER_TEMP_DIR, users, sizeof users);
-  if (named == nullptr && length > 0 && length <= sizeof users) directory = users;
+  if (!isNamed && length > 0 && length <= sizeof users) directory = users;
 #endif
   while (directory.size() > 1 && directory.back() == '/') directory.pop_back();
+  if (error != 0) {
+    log("The temporary directory %s cannot be used: %s; using %s", named, std::strerror(error), directory.c_str());
+  }
   return directory;
 }
 

@@ -26,8 +26,8 @@ class FileManager {
   static int keepRoom(int file, std::uint64_t bytes);
 };
 
-// The directory for files that others take away: TMPDIR where it names a directory, else the system's. No slash at the
-// end.
+// The directory for files that others take away: TMPDIR where it names a directory, else the system's, with a line in
+// the log where TMPDIR names something else. No slash at the end.
 std::string temporaryDirectory();
 
 // The directory part: all but the last component. "" for a bare name.

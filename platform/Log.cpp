@@ -10,7 +10,8 @@
 #include <cstdio>
 #include <ctime>
 #include <memory>
-#include <mutex>
+
+#include "Locks.h"
 
 namespace platform {
 namespace {
@@ -18,9 +19,11 @@ namespace {
 // The longest line that a pipe takes whole.
 constexpr std::size_t kLongestLine = 4096;
 
-std::mutex sinkLock;
-std::shared_ptr<const std::function<void(const std::string&)>>& currentSink() {
-  static std::shared_ptr<const std::function<void(const std::string&)>> sink;
+using Sink = std::function<void(const std::string&)>;
+
+Mutex sinkLock;
+std::shared_ptr<const Sink>& currentSink() REQUIRES(sinkLock) {
+  static std::shared_ptr<const Sink> sink;
   return sink;
 }
 
@@ -35,11 +38,32 @@ std::size_t writeStamp(char* out, std::size_t room) {
   return date + static_cast<std::size_t>(rest);
 }
 
-void writeLine(const char* line, std::size_t length) {
+// Held from the question whether there is room until the line is out: another thread would take the room.
+Mutex writeLock;
+unsigned long dropped GUARDED_BY(writeLock) = 0;  // lines since the last one that went out
+
+bool writeNow(const char* line, std::size_t length) {
   pollfd ready{STDERR_FILENO, POLLOUT, 0};
-  if (poll(&ready, 1, 0) != 1 || (ready.revents & POLLOUT) == 0) return;
-  while (write(STDERR_FILENO, line, length) < 0 && errno == EINTR) {
-  }
+  if (poll(&ready, 1, 0) != 1 || (ready.revents & POLLOUT) == 0) return false;
+  ssize_t written = 0;
+  do {
+    written = write(STDERR_FILENO, line, length);
+  } while (written < 0 && errno == EINTR);
+  return written >= 0;
+}
+
+bool writeNoteOfDropped() REQUIRES(writeLock) {
+  std::array<char, 160> line{};
+  const std::size_t stamp = writeStamp(line.data(), line.size());
+  const int text = std::snprintf(line.data() + stamp, line.size() - stamp,
+                                 "%lu log lines were dropped here: nobody read them\n", dropped);
+  return writeNow(line.data(), stamp + static_cast<std::size_t>(text));
+}
+
+void writeLine(const char* line, std::size_t length) {
+  const Guard guard(writeLock);
+  if (dropped > 0 && writeNoteOfDropped()) dropped = 0;
+  if (dropped > 0 || !writeNow(line, length)) ++dropped;
 }
 
 }  // namespace
@@ -55,9 +79,9 @@ void log(const char* format, ...) {
   va_end(arguments);
   const std::size_t text = wanted < 0 ? 0 : std::min(static_cast<std::size_t>(wanted), room - 1);
 
-  std::shared_ptr<const std::function<void(const std::string&)>> sink;
+  std::shared_ptr<const Sink> sink;
   {
-    std::lock_guard guard(sinkLock);
+    const Guard guard(sinkLock);
     sink = currentSink();
   }
   if (sink) {
@@ -71,7 +95,7 @@ void log(const char* format, ...) {
 
 void setLogSink(std::function<void(const std::string&)> sink) {
   auto fresh = sink ? std::make_shared<const std::function<void(const std::string&)>>(std::move(sink)) : nullptr;
-  std::lock_guard guard(sinkLock);
+  const Guard guard(sinkLock);
   currentSink().swap(fresh);
 }
 

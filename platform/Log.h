@@ -6,7 +6,8 @@
 
 namespace platform {
 
-// A line that standard error cannot take at once is dropped: a log that nobody reads must not stop the program.
+// A line that standard error cannot take at once is dropped: a log that nobody reads must not stop the program. Before
+// the next line that goes out another says how many were dropped.
 // Longer lines are cut at 4 KiB.
 [[gnu::format(printf, 1, 2)]] void log(const char* format, ...);
 

@@ -8,8 +8,8 @@ struct Observer::Entry {
   std::string name;
   const void* object;
   std::function<void(const Notification&)> handler;
-  std::recursive_mutex lock;  // held during a delivery
-  bool removed = false;
+  RecursiveMutex lock;  // held during a delivery
+  bool removed GUARDED_BY(lock) = false;
 };
 
 Observer& Observer::operator=(Observer&& other) noexcept {
@@ -23,7 +23,7 @@ Observer& Observer::operator=(Observer&& other) noexcept {
 void Observer::remove() {
   if (!_entry) return;
   const auto entry = std::move(_entry);
-  std::lock_guard guard(entry->lock);
+  const Guard guard(entry->lock);
   entry->removed = true;
 }
 
@@ -43,7 +43,7 @@ Observer NotificationCenter::addObserver(std::string name, const void* object,
   entry->name = std::move(name);
   entry->object = object;
   entry->handler = std::move(handler);
-  std::lock_guard guard(_lock);
+  const Guard guard(_lock);
   _entries.erase(std::remove_if(_entries.begin(), _entries.end(), [](const auto& weak) { return weak.expired(); }),
                  _entries.end());
   _entries.push_back(entry);
@@ -53,7 +53,7 @@ Observer NotificationCenter::addObserver(std::string name, const void* object,
 void NotificationCenter::post(const Notification& notification) {
   std::vector<std::shared_ptr<Observer::Entry>> addressed;
   {
-    std::lock_guard guard(_lock);
+    const Guard guard(_lock);
     for (const auto& weak : _entries) {
       auto entry = weak.lock();
       if (!entry) continue;
@@ -63,7 +63,7 @@ void NotificationCenter::post(const Notification& notification) {
     }
   }
   for (const auto& entry : addressed) {
-    std::lock_guard guard(entry->lock);
+    const Guard guard(entry->lock);
     if (!entry->removed) entry->handler(notification);
   }
 }

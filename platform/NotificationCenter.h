@@ -3,12 +3,12 @@
 
 #include <functional>
 #include <memory>
-#include <mutex>
 #include <string>
 #include <string_view>
 #include <vector>
 
 #include "Data.h"
+#include "Locks.h"
 
 namespace platform {
 
@@ -49,8 +49,8 @@ class NotificationCenter {
   void post(const Notification& notification);
 
  private:
-  std::mutex _lock;
-  std::vector<std::weak_ptr<Observer::Entry>> _entries;
+  Mutex _lock;
+  std::vector<std::weak_ptr<Observer::Entry>> _entries GUARDED_BY(_lock);
 };
 
 // Names.

@@ -8,9 +8,9 @@
 #include <array>
 #include <cassert>
 #include <cerrno>
-#include <condition_variable>
 #include <exception>
 #include <limits>
+#include <optional>
 #include <system_error>
 #include <utility>
 
@@ -19,21 +19,35 @@
 namespace platform {
 
 struct RunLoop::Waiter {
-  std::mutex lock;
-  std::condition_variable changed;
-  bool done = false;
-  bool ran = false;
-  std::exception_ptr thrown;
+  Mutex lock;
+  Condition changed;
+  bool done GUARDED_BY(lock) = false;
+  bool ran GUARDED_BY(lock) = false;
+  std::exception_ptr thrown GUARDED_BY(lock);
+
+  bool waitForEnd() {
+    const Guard guard(lock);
+    while (!done) changed.wait(lock);
+    if (thrown) std::rethrow_exception(thrown);
+    return ran;
+  }
+
+  bool waitUntil(Clock::time_point until) {
+    const Guard guard(lock);
+    while (!done && changed.waitUntil(lock, until)) {
+    }
+    return done;
+  }
 
   // Whoever calls this keeps the waiter; so the waiting thread may be woken outside the lock, which it wants at once.
   void finish(bool hasRun, std::exception_ptr exception) {
     {
-      std::lock_guard guard(lock);
+      const Guard guard(lock);
       done = true;
       ran = hasRun;
       thrown = std::move(exception);
     }
-    changed.notify_all();
+    changed.notifyAll();
   }
 };
 
@@ -112,7 +126,7 @@ RunLoop::~RunLoop() {
 
 bool RunLoop::isCurrent() const { return threadLoop.get() == this; }
 
-bool RunLoop::post(Call call) { return enqueue(std::move(call), nullptr); }
+bool RunLoop::post(Call call) { return enqueue(std::move(call), nullptr, false); }
 
 bool RunLoop::perform(const Call& call) {
   if (isCurrent()) {
@@ -120,18 +134,36 @@ bool RunLoop::perform(const Call& call) {
     return true;
   }
   auto waiter = std::make_shared<Waiter>();
-  if (!enqueue(call, waiter)) return false;
-  std::unique_lock guard(waiter->lock);
-  waiter->changed.wait(guard, [&] { return waiter->done; });
-  if (waiter->thrown) std::rethrow_exception(waiter->thrown);
-  return waiter->ran;
+  return enqueue(call, waiter, false) && waiter->waitForEnd();
 }
 
-bool RunLoop::enqueue(Call call, std::shared_ptr<Waiter> waiter) {
+bool RunLoop::performUrgently(const Call& call, Clock::duration wait) {
+  if (isCurrent()) {
+    call();
+    return true;
+  }
+  auto waiter = std::make_shared<Waiter>();
+  if (!enqueue(call, waiter, true)) return false;
+  if (!waiter->waitUntil(Clock::now() + wait) && takeBack(*waiter)) return false;
+  return waiter->waitForEnd();
+}
+
+bool RunLoop::takeBack(const Waiter& waiter) {
+  std::optional<Posted> taken;
+  const Guard guard(_lock);
+  const auto place = std::find_if(_posted.begin(), _posted.end(),
+                                  [&](const Posted& posted) { return posted.waiter.get() == &waiter; });
+  if (place == _posted.end()) return false;  // it has begun, or the loop has ended
+  taken = takePosted(place);
+  return true;
+}
+
+bool RunLoop::enqueue(Call call, std::shared_ptr<Waiter> waiter, bool urgent) {
   {
-    std::lock_guard guard(_lock);
+    const Guard guard(_lock);
     if (_ended) return false;
-    _posted.push_back({Clock::now(), _nextOrder++, std::move(call), std::move(waiter)});
+    _posted.push_back({Clock::now(), _nextOrder++, std::move(call), std::move(waiter), urgent});
+    if (urgent) ++_urgent;
   }
   wakeUp();
   return true;
@@ -139,7 +171,7 @@ bool RunLoop::enqueue(Call call, std::shared_ptr<Waiter> waiter) {
 
 void RunLoop::wakeUp() {
   {
-    std::lock_guard guard(_lock);
+    const Guard guard(_lock);
     if (std::exchange(_wakeUpSent, true)) return;
   }
   // Outside the lock, which the loop wants as soon as it wakes.
@@ -151,7 +183,7 @@ void RunLoop::wakeUp() {
 void RunLoop::end() {
   std::deque<Posted> dropped;
   {
-    std::lock_guard guard(_lock);
+    const Guard guard(_lock);
     _ended = true;
     dropped.swap(_posted);
   }
@@ -186,7 +218,7 @@ void RunLoop::turn(Clock::time_point until) {
   const auto now = Clock::now();
   std::uint64_t limit = 0;
   {
-    std::lock_guard guard(_lock);
+    const Guard guard(_lock);
     limit = _nextOrder;
   }
   while (runNextDue(now, limit)) {
@@ -202,7 +234,7 @@ std::uint64_t RunLoop::schedule(Clock::duration delay, Clock::duration interval,
   assert(isCurrent());
   std::uint64_t order = 0;
   {
-    std::lock_guard guard(_lock);
+    const Guard guard(_lock);
     order = _nextOrder++;
   }
   const std::uint64_t id = _nextId++;
@@ -229,14 +261,14 @@ void RunLoop::cancel(std::uint64_t id) {
 
 bool RunLoop::hasInputs() {
   if (!_timers.empty() || _firing != nullptr || !_watches.empty()) return true;
-  std::lock_guard guard(_lock);
+  const Guard guard(_lock);
   return !_posted.empty();
 }
 
 void RunLoop::waitForWork(Clock::time_point until) {
   if (!_timers.empty()) until = std::min(until, _timers.front().due);
   {
-    std::lock_guard guard(_lock);
+    const Guard guard(_lock);
     if (!_posted.empty()) until = Clock::time_point::min();
   }
 
@@ -263,7 +295,7 @@ void RunLoop::waitForWork(Clock::time_point until) {
     _watches[index]->ready = polled[index + 1].revents != 0;
   }
   if (polled[0].revents != 0) {
-    std::lock_guard guard(_lock);
+    const Guard guard(_lock);
     char byte = 0;  // there is never more than one
     while (read(_wakeRead, &byte, 1) < 0 && errno == EINTR) {
     }
@@ -273,37 +305,63 @@ void RunLoop::waitForWork(Clock::time_point until) {
 
 bool RunLoop::runNextDue(Clock::time_point now, std::uint64_t limit) {
   const bool timerIsDue = !_timers.empty() && _timers.front().due <= now && _timers.front().order < limit;
-
-  std::unique_lock guard(_lock);
-  const bool postedIsDue = !_posted.empty() && _posted.front().order < limit;
-  if (!timerIsDue && !postedIsDue) return false;
-
-  const bool postedIsFirst = postedIsDue && (!timerIsDue || std::pair(_posted.front().due, _posted.front().order) <
-                                                                std::pair(_timers.front().due, _timers.front().order));
-  if (postedIsFirst) {
-    Posted posted = std::move(_posted.front());
-    _posted.pop_front();
-    guard.unlock();
-    std::exception_ptr thrown;
-    try {
-      posted.call();
-    } catch (...) {
-      if (posted.waiter) {
-        thrown = std::current_exception();
-      } else {
-        logUncaught();
-      }
-    }
-    posted.call = nullptr;
-    if (posted.waiter) posted.waiter->finish(true, std::move(thrown));
+  std::optional<Posted> posted;
+  {
+    const Guard guard(_lock);
+    const bool postedIsDue = !_posted.empty() && _posted.front().order < limit;
+    if (!timerIsDue && !postedIsDue) return false;
+    const bool postedIsFirst =
+        postedIsDue && (!timerIsDue || std::pair(_posted.front().due, _posted.front().order) <
+                                           std::pair(_timers.front().due, _timers.front().order));
+    if (postedIsFirst) posted = takePosted(_posted.begin());
+  }
+  if (posted) {
+    runPosted(std::move(*posted));
     return true;
   }
-
-  guard.unlock();
   std::pop_heap(_timers.begin(), _timers.end(), Later());
   Scheduled due = std::move(_timers.back());
   _timers.pop_back();
   fire(std::move(due));
+  return true;
+}
+
+RunLoop::Posted RunLoop::takePosted(const std::deque<Posted>::iterator& place) {
+  Posted posted = std::move(*place);
+  _posted.erase(place);
+  if (posted.urgent) --_urgent;
+  return posted;
+}
+
+void RunLoop::runPosted(Posted posted) {
+  std::exception_ptr thrown;
+  try {
+    posted.call();
+  } catch (...) {
+    if (posted.waiter) {
+      thrown = std::current_exception();
+    } else {
+      logUncaught();
+    }
+  }
+  posted.call = nullptr;
+  if (posted.waiter) posted.waiter->finish(true, std::move(thrown));
+}
+
+void RunLoop::runUrgentCalls() {
+  while (threadLoop && threadLoop->_urgent > 0 && threadLoop->runNextUrgent()) {
+  }
+}
+
+bool RunLoop::runNextUrgent() {
+  std::optional<Posted> posted;
+  {
+    const Guard guard(_lock);
+    const auto next = std::find_if(_posted.begin(), _posted.end(), [](const Posted& each) { return each.urgent; });
+    if (next == _posted.end()) return false;
+    posted = takePosted(next);
+  }
+  runPosted(std::move(*posted));
   return true;
 }
 
@@ -322,7 +380,7 @@ void RunLoop::fire(Scheduled timer) {
   const auto now = Clock::now();
   if (timer.due <= now) timer.due += ((now - timer.due) / timer.interval + 1) * timer.interval;
   {
-    std::lock_guard guard(_lock);
+    const Guard guard(_lock);
     timer.order = _nextOrder++;
   }
   insert(std::move(timer));

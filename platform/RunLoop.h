@@ -16,13 +16,15 @@
 //   run, and those who wait for them, and those who post later, are told so.
 #pragma once
 
+#include <atomic>
 #include <chrono>
 #include <cstdint>
 #include <deque>
 #include <functional>
 #include <memory>
-#include <mutex>
 #include <vector>
+
+#include "Locks.h"
 
 namespace platform {
 
@@ -57,6 +59,9 @@ class RunLoop : public std::enable_shared_from_this<RunLoop> {
   // Runs a call on the loop's thread and waits until it has run; from that thread itself, runs it at once. False when
   // the loop ended first: the call did not and will not run. Rethrows what the call throws.
   bool perform(const Call& call);
+  // As perform(), but the loop's thread may also run the call where it asks for urgent ones, and one that it has not
+  // begun within `wait` is taken back: false.
+  bool performUrgently(const Call& call, Clock::duration wait);
   // Ends a wait in progress, as a posted call that does nothing would.
   void wakeUp();
 
@@ -70,6 +75,8 @@ class RunLoop : public std::enable_shared_from_this<RunLoop> {
   bool runOnce(Clock::time_point until);
   // Runs a call once, not before the delay has passed, unless the loop ends first.
   void performAfter(Seconds delay, Call call);
+  // Runs the urgent calls that wait for the calling thread, in order: for a thread that is kept from turning its loop.
+  static void runUrgentCalls();
 
  private:
   friend class Timer;
@@ -81,6 +88,7 @@ class RunLoop : public std::enable_shared_from_this<RunLoop> {
     std::uint64_t order;
     Call call;
     std::shared_ptr<Waiter> waiter;
+    bool urgent;
   };
   struct Scheduled {
     Clock::time_point due;
@@ -94,7 +102,11 @@ class RunLoop : public std::enable_shared_from_this<RunLoop> {
   struct Watch;
 
   RunLoop();
-  bool enqueue(Call call, std::shared_ptr<Waiter> waiter);
+  bool enqueue(Call call, std::shared_ptr<Waiter> waiter, bool urgent);
+  bool takeBack(const Waiter& waiter);
+  static void runPosted(Posted posted);
+  bool runNextUrgent();
+  Posted takePosted(const std::deque<Posted>::iterator& place) REQUIRES(_lock);
   void end();
   std::uint64_t schedule(Clock::duration delay, Clock::duration interval, Call call);
   void cancel(std::uint64_t id);
@@ -106,12 +118,13 @@ class RunLoop : public std::enable_shared_from_this<RunLoop> {
   void insert(Scheduled timer);
   bool hasInputs();
 
-  // Guarded by _lock: what other threads touch.
-  std::mutex _lock;
-  std::deque<Posted> _posted;
-  std::uint64_t _nextOrder = 0;
-  bool _wakeUpSent = false;
-  bool _ended = false;
+  // What other threads touch.
+  Mutex _lock;
+  std::deque<Posted> _posted GUARDED_BY(_lock);
+  std::atomic<int> _urgent{0};  // of these; read without the lock
+  std::uint64_t _nextOrder GUARDED_BY(_lock) = 0;
+  bool _wakeUpSent GUARDED_BY(_lock) = false;
+  bool _ended GUARDED_BY(_lock) = false;
   int _wakeRead = -1;
   int _wakeWrite = -1;
 

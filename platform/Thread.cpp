@@ -30,6 +30,7 @@ std::shared_ptr<Thread> Thread::make(std::function<void()> body) {
 std::shared_ptr<Thread> Thread::current() {
   if (!currentThread) {
     currentThread = make(nullptr);
+    const Guard guard(currentThread->_lock);
     currentThread->_runLoop = RunLoop::current();
   }
   return currentThread;
@@ -44,36 +45,36 @@ void Thread::main(const std::shared_ptr<RunLoop>& loop) {
   currentThread = shared_from_this();
   RunLoop::setCurrent(loop);
   {
-    std::lock_guard guard(_lock);
+    const Guard guard(_lock);
     _runLoop = loop;
-    _changed.notify_all();
+    _changed.notifyAll();
   }
   _body();
   _body = nullptr;
   RunLoop::endCurrent();
-  std::lock_guard guard(_lock);
+  const Guard guard(_lock);
   _finished = true;
-  _changed.notify_all();
+  _changed.notifyAll();
 }
 
 void Thread::cancel() {
   _cancelled = true;
   std::shared_ptr<RunLoop> loop;
   {
-    std::lock_guard guard(_lock);
+    const Guard guard(_lock);
     loop = _runLoop;
   }
   if (loop) loop->wakeUp();
 }
 
 void Thread::join() {
-  std::unique_lock guard(_lock);
-  _changed.wait(guard, [&] { return _finished; });
+  const Guard guard(_lock);
+  while (!_finished) _changed.wait(_lock);
 }
 
 std::shared_ptr<RunLoop> Thread::runLoop() {
-  std::unique_lock guard(_lock);
-  _changed.wait(guard, [&] { return _runLoop != nullptr; });
+  const Guard guard(_lock);
+  while (!_runLoop) _changed.wait(_lock);
   return _runLoop;
 }
 
@@ -85,12 +86,12 @@ void Thread::setCurrentName(const std::string& name) {
   pthread_setname_np(pthread_self(), name.substr(0, 15).c_str());
 #endif
   const auto self = current();
-  std::lock_guard guard(self->_lock);
+  const Guard guard(self->_lock);
   self->_name = name;
 }
 
 std::string Thread::description() const {
-  std::lock_guard guard(_lock);
+  const Guard guard(_lock);
   return "<thread " + std::to_string(_number) + (_name.empty() ? ">" : ": " + _name + ">");
 }
 

@@ -2,12 +2,11 @@
 #pragma once
 
 #include <atomic>
-#include <condition_variable>
 #include <functional>
 #include <memory>
-#include <mutex>
 #include <string>
 
+#include "Locks.h"
 #include "RunLoop.h"
 
 namespace platform {
@@ -44,11 +43,11 @@ class Thread : public std::enable_shared_from_this<Thread> {
   const int _number;
   std::function<void()> _body;
   std::atomic<bool> _cancelled{false};
-  mutable std::mutex _lock;
-  std::condition_variable _changed;
-  std::string _name;
-  std::shared_ptr<RunLoop> _runLoop;
-  bool _finished = false;
+  mutable Mutex _lock;
+  Condition _changed;
+  std::string _name GUARDED_BY(_lock);
+  std::shared_ptr<RunLoop> _runLoop GUARDED_BY(_lock);
+  bool _finished GUARDED_BY(_lock) = false;
 };
 
 }  // namespace platform

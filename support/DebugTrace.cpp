@@ -4,8 +4,8 @@
 #include <cstdio>
 #include <cstring>
 #include <memory>
-#include <mutex>
 
+#include "Locks.h"
 #include "Log.h"
 
 namespace {
@@ -14,10 +14,10 @@ constexpr std::size_t kLongestText = 2048;  // with its NUL
 
 using Sink = std::function<void(const char*)>;
 
-std::mutex sinkLock;
+platform::Mutex sinkLock;
 std::atomic<bool> hasSink{false};
 
-std::shared_ptr<const Sink>& replacement() {
+std::shared_ptr<const Sink>& replacement() REQUIRES(sinkLock) {
   static std::shared_ptr<const Sink> sink;
   return sink;
 }
@@ -37,7 +37,7 @@ void debugmsg(const char* text) {
   }
   std::shared_ptr<const Sink> sink;
   {
-    std::lock_guard guard(sinkLock);
+    const platform::Guard guard(sinkLock);
     sink = replacement();
   }
   if (sink) (*sink)(text);
@@ -67,7 +67,7 @@ void debugmsgstr(const char* format, const char* value) {
 
 void setDebugSink(std::function<void(const char*)> sink) {
   auto fresh = sink ? std::make_shared<const Sink>(std::move(sink)) : nullptr;
-  std::lock_guard guard(sinkLock);
+  const platform::Guard guard(sinkLock);
   hasSink = fresh != nullptr;
   replacement().swap(fresh);
 }

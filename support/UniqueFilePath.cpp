@@ -26,6 +26,7 @@ std::string KtFileUtils_ensureFileNameIsUnique(const std::string& path) {
   return candidate;
 }
 
-std::string MakeUniqueFilePath(const std::string& directory, const std::string& name) {
+// NOLINTNEXTLINE(performance-unnecessary-value-param): the signature is given
+std::string MakeUniqueFilePath(std::string& directory, std::string name) {
   return KtFileUtils_ensureFileNameIsUnique(platform::appendingPathComponent(directory, name));
 }

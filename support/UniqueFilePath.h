@@ -8,4 +8,4 @@
 std::string KtFileUtils_ensureFileNameIsUnique(const std::string& path);
 
 // A unique path for a file of that name in the directory, which is left as it is.
-std::string MakeUniqueFilePath(const std::string& directory, const std::string& name);
+std::string MakeUniqueFilePath(std::string& directory, std::string name);

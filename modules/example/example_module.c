@@ -93,11 +93,13 @@ static int32_t setCallback(tagNkMAIDCallback* callback, uint64_t data) {
   return kNkMAIDResult_NoError;
 }
 
-/* The header of a list where there is no array to fill, else its elements. */
+/* The header of a list where there is no array to fill, else its elements, into as much room as the header asked for.
+ */
 static int32_t getList(uint64_t data, int wantsElements, uint32_t type, const void* elements, uint32_t count,
                        int16_t size, uint32_t current) {
   tagNkMAIDEnum* list = pointer(data);
   if (wantsElements) {
+    if (list->elementCount != count || list->elementSize != size) return kNkMAIDResult_BufferSize;
     memcpy(list->elements, elements, (size_t)count * (size_t)size);
     return kNkMAIDResult_NoError;
   }

@@ -99,7 +99,6 @@ class LyingModule {
   std::map<decltype(Place().kind()), std::uint32_t> _counts;
   std::vector<Place> _places;
   std::map<const tagNkMAIDObject*, std::pair<Place, const tagNkMAIDObject*>> _open;  // with their parents
-  std::map<const tagNkMAIDObject*, std::thread::id> _closedBy;
   std::deque<Registered> _eventProcs;
   std::deque<Registered> _dataProcs;
   std::vector<std::pair<NkMAIDCompletionProc*, void*>> _completions;

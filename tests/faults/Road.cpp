@@ -66,7 +66,10 @@ void Road::run() {
   _service.reset();
   module.storm();
   module.endStorms();
-  _elsewhere.reset();
+  {
+    const std::lock_guard access(getAsyncLock());  // a fence of it may be in use
+    _elsewhere.reset();
+  }
   module.expectAllClosed();
   verify();
 }
@@ -105,6 +108,7 @@ void Road::leaveQueued() {
 
 // What is wrong with one camera, or was wrong for a moment, is not wrong with the others, or later.
 void Road::expectUnhurtCamerasToWork() {
+  module.endStorms();
   settle();
   for (const std::uint32_t camera : {1U, 2U}) {
     if (model.camera(camera) == nullptr) plugIn(camera);
@@ -113,6 +117,7 @@ void Road::expectUnhurtCamerasToWork() {
   idle();
   request(&NikonTetherService::listDevices, 0, false);
   const bool before = module.reached();
+  module.endStorms();  // one that these calls brought
   std::map<std::uint32_t, std::size_t> last;
   for (const std::uint32_t camera : {1U, 2U}) {
     last[camera] = _sent.size();

@@ -50,16 +50,23 @@ struct Trial {
     helper.setEnvironment(
         "TETHER_FAIL", std::string(failure.kind) + " " + std::to_string(number) + " " + std::to_string(failure.error));
     files.emplace_back(kLast);
+    std::filesystem::create_directories(helper.cameras() / "1-Studio");
+    helper.start();
+  }
+
+  bool injected() const { return helper.standardError().find("injected") != std::string::npos; }
+
+  // Before the camera is there they would be on its card. The host that is lost may not hear of it.
+  void shoot() {
+    if (!failure.losesTheHost) helper.await("deviceAdded");
+    awaitCondition("camera", [this] { return !failure.losesTheHost || helper.unread() > 0 || injected(); });
     for (const std::string& file : files) {
       // Each needs a larger buffer than the one before, and room on the disk.
       const std::string bytes = file == kLast ? pattern(1000, 9) : pattern(1'100'000 + 100'000 * sent.size(), 1);
       drop(helper.cameras() / "1-Studio" / file, bytes);
       sent.insert(bytes);
     }
-    helper.start();
   }
-
-  bool injected() const { return helper.standardError().find("injected") != std::string::npos; }
 
   void awaitTheLast() {
     if (!failure.losesTheHost) {
@@ -105,6 +112,7 @@ class FailingCall : public testing::TestWithParam<Failure> {};
 // Whether one of the calls did not fail, because there are no more of its kind.
 bool allAreThrough(std::list<Trial>& runs) {
   bool through = false;
+  for (Trial& run : runs) run.shoot();
   for (Trial& run : runs) {
     run.awaitTheLast();
     run.helper.closeInput();
@@ -139,6 +147,7 @@ TEST_P(FailingStart, EndsWithALineThatSaysSoAndAStatus) {
     Trial run(GetParam(), number, std::vector<std::string>());
     bool started = true;
     try {
+      run.shoot();
       run.awaitTheLast();
     } catch (const std::runtime_error&) {
       started = false;

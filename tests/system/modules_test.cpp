@@ -64,7 +64,8 @@ TEST_F(Modules, TheExampleInCIsLoadedListedReadFiredAndDelivers) {
 TEST_F(Modules, ThatDoNotLoadOrOpenAreSkippedAndTheOthersWork) {
   writeExecutable("Type0002Module", "no library\n");
   helper.install("Type0003Module", MODULE_WITHOUT_ENTRY);
-  helper.install("Type0004Module", MODULE_THAT_FAILS);
+  helper.install("Type0004Module", BROKEN_MODULE);
+  helper.setEnvironment("BROKEN", "fails");
   fs::create_directories(helper.helpers() / "Type0006Module.bundle/Contents" / TETHER_BUNDLE_PLATFORM);
   writeExecutable("Type0007Module", readFile(TETHER_HELPER));                          // a program
   writeExecutable("Type0008Module", readFile(VIRTUAL_CAMERA_MODULE).substr(0, 5000));  // a copy that was cut short

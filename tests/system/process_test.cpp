@@ -1,6 +1,7 @@
 // The process: start, heartbeat, end, and a host that does not do its part.
 
 #include <csignal>
+#include <cstdlib>
 #include <string>
 
 #include "Helper.h"
@@ -40,26 +41,35 @@ TEST_F(Process, WithoutModulesSendsHeartbeatsAndAnswersNoRequestThatNamesADevice
 }
 
 TEST_F(Process, EndsWithItsInputOrASignalAndTakesAFileThatIsNotWholeAlong) {
-  for (const int signal : {0, SIGTERM, SIGINT}) {
+  const int kTermInShutdown = -SIGTERM;
+  for (const int signal : {0, SIGTERM, SIGINT, kTermInShutdown}) {
     Helper other;
     other.install("Type0001Module", VIRTUAL_CAMERA_MODULE);
     drop(other.cameras() / "1-Studio/camera.json", kSlow);
-    drop(other.cameras() / "1-Studio/1.jpg", pattern(1'000'000, 1));
     other.start();
+    other.await("deviceAdded");
+    drop(other.cameras() / "1-Studio/1.jpg", pattern(1'000'000, 1));
     other.await("objectWasAdded");
     EXPECT_TRUE(fs::exists(other.temporary() / "Capture0001.jpg"));
-    signal == 0 ? other.closeInput() : static_cast<void>(kill(other.pid(), signal));
+    if (signal == kTermInShutdown) {
+      other.send(request("shutdown", 1));
+      awaitCondition("shutdown read", [&] { return other.unreadByHelper() == 0; });
+    }
+    if (signal <= 0) other.closeInput();
+    if (signal != 0) kill(other.pid(), std::abs(signal));
     EXPECT_EQ(other.wait(), 0);
     EXPECT_EQ(other.count("fileDownloadComplete"), 0U);
     EXPECT_TRUE(fs::is_empty(other.temporary()));
   }
 }
 
+// The pipe is closed at once, and the transfer takes longer than its end alone would leave it.
 TEST_F(Process, BringsATransferToItsEndOnShutdownAndCarriesOutNothingBehindIt) {
-  startWithCamera(R"({"transfer": {"deliveryBytes": 1000, "bytesPerSecond": 10000}})");
+  startWithCamera(R"({"transfer": {"deliveryBytes": 1000, "bytesPerSecond": 1500}})");
   for (const char* name : {"1.jpg", "2.jpg", "3.jpg"}) drop(studio() / name, pattern(5000, 1));
   helper.await("objectWasAdded");
   helper.send(request("connectDevice", 1, kStudio) + request("shutdown", 2) + request("connectDevice", 3, 0x0109));
+  helper.closeInput();
   EXPECT_EQ(helper.wait(), 0);
   EXPECT_EQ(helper.awaitAnswer(1).name, "ok");
   for (const Message& message : helper.messages()) EXPECT_NE(message.id, 3);

@@ -2,10 +2,11 @@
 
 #include <memory>
 
+#include "CameraEvents.h"
 #include "ContentContainer.h"
 #include "DebugTrace.h"
+#include "Log.h"
 #include "NameTables.h"
-#include "NikonTetherService.h"
 
 namespace {
 
@@ -58,10 +59,17 @@ std::int32_t CCamera::connect() {
   return 0;
 }
 
-void CCamera::doCapture() { issueCommand(kNkMAIDCapability_Capture, this, nullptr); }
+void CCamera::doCapture() { logShutter(issueCommand(kNkMAIDCapability_Capture, this, nullptr)); }
 
-void CCamera::completionCallback(std::int32_t command, std::int32_t /*result*/, void* /*context*/) {
+void CCamera::completionCallback(std::int32_t command, std::int32_t result, void* /*context*/) {
   debugmsgstr("CCamera completion callback for command %s", commandToName(command));
+  logShutter(result);
+}
+
+// The host is told nothing of a shutter that failed: the log is all there is.
+void CCamera::logShutter(std::int32_t result) const {
+  if (result == kNkMAIDResult_NoError) return;
+  platform::log("The shutter of camera %d (%s) failed: %s", _id, _name.c_str(), errorToName(result));
 }
 
 void CCamera::eventNotification(std::int32_t event, void* data) {
@@ -78,19 +86,21 @@ void CCamera::handleNewContainer(std::int32_t itemId) {
     container = std::make_unique<CContentContainer>(this, itemId, downloadId);
   } catch (std::int32_t result) {
     debugmsgint("CCamera::handleNewContainer - could not open item, error: %d", result);
+    platform::log("Item %d of camera %d (%s) could not be opened: %s", itemId, _id, _name.c_str(), errorToName(result));
     return;
   }
+  container->setCameraName(_name);
   number(*container, downloadId);
-  NikonTetherService::getSingleton()->addItemToDownloadQueue(container.release());
+  CameraEvents::current().addItemToDownloadQueue(container.release());
 }
 
 std::int32_t CCamera::nextDownloadId() {
-  const std::lock_guard guard(_numberLock);
+  const platform::Guard guard(_numberLock);
   return _downloadId;
 }
 
 void CCamera::number(CContentContainer& container, std::int32_t given) {
-  const std::lock_guard guard(_numberLock);
+  const platform::Guard guard(_numberLock);
   if (_rawPlusJpegPending && !container.isRawPlusJPEG()) {
     // The pair's second file never came: that shot is done, this is another one.
     _rawPlusJpegPending = false;
@@ -109,11 +119,12 @@ void CCamera::number(CContentContainer& container, std::int32_t given) {
 }
 
 std::int32_t CCamera::makeCameraSettingsMessage(KtLuaTETable*& table) {
-  table = new KtLuaTETable;
+  auto made = std::make_unique<KtLuaTETable>();
   for (const Setting& setting : kSettings) {
     std::unique_ptr<KtLuaTE> value = getCapabilityAsTE(setting.capability);
     if (!value) value = std::make_unique<KtLuaTENil>();
-    table->Set(setting.key, value.release());
+    made->Set(setting.key, value.release());
   }
+  table = made.release();
   return 0;
 }

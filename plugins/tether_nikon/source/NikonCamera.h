@@ -1,7 +1,6 @@
 // One camera: a device object opened as a child of its module.
 #pragma once
 
-#include <mutex>
 #include <string>
 
 #include "NikonObject.h"
@@ -34,12 +33,14 @@ class CCamera : public CNikonObject {
   std::int32_t disconnect() { return 0; }
   // Fires the shutter, where there is one to fire, and drives the SDK on this thread until that is completed.
   void doCapture();
-  // Makes a new table of the settings, owned by the caller, with nil for each that cannot be read. Always 0.
+  // Makes a new table of the settings, owned by the caller, with nil for each that cannot be read. Always 0; what is
+  // thrown leaves no table.
   std::int32_t makeCameraSettingsMessage(KtLuaTETable*& table);
 
  private:
   void setCamera(std::int32_t cameraId);
   void handleNewContainer(std::int32_t itemId);
+  void logShutter(std::int32_t result) const;
   std::int32_t nextDownloadId();
   // Gives the item, opened with that id, its final one and counts it.
   void number(CContentContainer& container, std::int32_t given);
@@ -47,7 +48,7 @@ class CCamera : public CNikonObject {
   std::string _name;
   std::int32_t _id = 0;
   bool _touched = false;
-  std::mutex _numberLock;            // of these two: a module may announce items on threads of its own
-  bool _rawPlusJpegPending = false;  // the first file of a pair has come, its partner not yet
-  std::int32_t _downloadId = 1;      // the next item's
+  platform::Mutex _numberLock;                               // a module may announce items on threads of its own
+  bool _rawPlusJpegPending GUARDED_BY(_numberLock) = false;  // the first file of a pair has come, its partner not yet
+  std::int32_t _downloadId GUARDED_BY(_numberLock) = 1;      // the next item's
 };

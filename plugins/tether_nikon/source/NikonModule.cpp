@@ -4,11 +4,11 @@
 #include <exception>
 #include <vector>
 
+#include "CameraEvents.h"
 #include "DebugTrace.h"
 #include "DeferredCalls.h"
 #include "HostMessages.h"
 #include "NameTables.h"
-#include "NikonTetherService.h"
 
 namespace {
 
@@ -32,10 +32,15 @@ CNikonModule::~CNikonModule() {
   CallDelay::cancelCallsToProc(DoUpdateHost, this);
 }
 
+void CNikonModule::leaveBehind() {
+  shutGates();
+  CallDelay::cancelCallsToProc(DoUpdateHost, this);
+}
+
 void CNikonModule::eventNotification(std::int32_t event, void* /*data*/) {
   debugmsgstr("Service event notification: %s", eventToName(event));
   if (event == kNkMAIDEvent_AddChild || event == kNkMAIDEvent_RemoveChild) {
-    NikonTetherService::getSingleton()->doCameraScanOnIdle();
+    CameraEvents::current().doCameraScanOnIdle();
   }
 }
 
@@ -125,7 +130,7 @@ void CNikonModule::removeCamera(CCamera* camera) {
                 camera->getName().c_str(), camera->getId());
   debugmsg(line);
   SendMessageToClient(0, "deviceRemoved", deviceTable(camera).get());
-  camera->abandonWaits();  // a transfer that will never complete must not keep the download thread
+  camera->abandonWaits();  // a transfer ends first, but one that never does must not keep the download thread
   _camerasToDelete.push_back(camera);
 }
 

@@ -17,11 +17,15 @@ class CNikonModule : public CNikonObject {
   // A settings update that was put off is cancelled.
   ~CNikonModule() override;
 
+  // At the end, in place of the destruction, where a transfer keeps the SDK: no callback of the module or of anything
+  // below it gets through any more.
+  void leaveBehind();
+
   // A camera that came or went sets the service's scan flag. Any thread.
   void eventNotification(std::int32_t event, void* data) override;
 
   std::int32_t getModuleId() const { return _moduleId; }
-  // Removed cameras that wait to be deleted, in order of removal; whoever deletes them empties the list.
+  // Removed cameras that wait to be deleted, in order of removal; whoever deletes one takes it off the list.
   std::list<CCamera*>& getCamerasToDelete() { return _camerasToDelete; }
   // 0 for none.
   std::int32_t getConnectedCameraId() const { return _connectedCamera == nullptr ? 0 : _connectedCamera->getId(); }

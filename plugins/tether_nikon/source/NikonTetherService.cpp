@@ -27,6 +27,7 @@ constexpr std::int32_t kCameraIdMask = 0x00FF;
 constexpr int kSettingsError = 0xFFFF;
 constexpr auto kSettingsLockWait = 100ms;
 constexpr auto kEndLockWait = 30s;
+constexpr auto kRemovalWait = 2s;
 
 std::string gTemporaryDirectoryPath;
 
@@ -34,7 +35,7 @@ std::string gTemporaryDirectoryPath;
 
 NikonTetherService* NikonTetherService::_singleton = nullptr;
 NikonDownloadThread* NikonTetherService::_downloadThreadObj = nullptr;
-std::int32_t NikonTetherService::_captureId = 0;
+bool NikonTetherService::_modulesLeftBehind = false;
 
 NikonTetherService* NikonTetherService::getSingleton() {
   if (_singleton == nullptr) new NikonTetherService;
@@ -78,9 +79,18 @@ NikonTetherService::~NikonTetherService() {
     if (access) {
       module.reset();
     } else {
-      static_cast<void>(module.release());
+      _modulesLeftBehind = true;
+      _thread->cancel();  // what is queued is not begun any more
+      module.release()->leaveBehind();
     }
   }
+}
+
+// Not inlined: the compiler would take the pair for a mismatched one.
+[[gnu::noinline]] void* NikonTetherService::operator new(std::size_t size) { return ::operator new(size); }
+
+[[gnu::noinline]] void NikonTetherService::operator delete(void* memory) {
+  if (!_modulesLeftBehind) ::operator delete(memory);
 }
 
 CNikonModule* NikonTetherService::getModuleById(std::int32_t moduleId) const {
@@ -177,37 +187,48 @@ void NikonTetherService::doCapture(int /*messageId*/, KtLuaTE* /*data*/) {
 
 // The idle pass.
 
+// A request of another thread comes at any place of a pass; a whole pass of its own is what makes sure of it.
 void NikonTetherService::doCameraScanOnIdle() {
-  _scanOnIdle = true;
-  if (platform::Thread::current() != _mainThread) _scanOnNextIdle = true;
+  if (std::this_thread::get_id() == _mainThread) {
+    _scanOnIdle = true;
+  } else {
+    _scanRequested = true;
+  }
 }
 
 void NikonTetherService::idle() {
-  _scanOnNextIdle = false;
+  if (_scanRequested.exchange(false)) _scanOnIdle = true;
   for (const auto& module : _modules) {
     module->async();
     if (_scanOnIdle) module->scanAndInformHostOfCameraChanges();
   }
   for (const auto& module : _modules) deleteRemovedCameras(*module);
-  _scanOnIdle = _scanOnNextIdle.load();
+  _scanOnIdle = false;
 }
 
 void NikonTetherService::deleteRemovedCameras(CNikonModule& module) {
-  auto& cameras = module.getCamerasToDelete();
-  for (CCamera* const camera : cameras) {
-    const auto wrapper = CameraWrapper::wrapperForCamera(camera);
-    _thread->runLoop()->perform([&] { _downloadThreadObj->removeAllCameraContent(*wrapper); });
+  // One with pictures in transfer or queued is deleted in a later pass: they come first, and this thread, which may be
+  // the one that brings their deliveries, does not stand still meanwhile.
+  module.getCamerasToDelete().remove_if([this](CCamera* camera) { return !camera->hasChildren() && remove(camera); });
+}
+
+// Between two polls, where the download thread waits for another camera's transfer. False when it did not get to it.
+bool NikonTetherService::remove(CCamera* camera) {
+  const auto wrapper = CameraWrapper::wrapperForCamera(camera);
+  if (_thread->runLoop()->performUrgently([&] { _downloadThreadObj->removeAllCameraContent(*wrapper); },
+                                          kRemovalWait)) {
+    return true;
   }
-  cameras.clear();
+  wrapper->setCamera(nullptr);  // still the module's
+  return false;
 }
 
 // Pictures.
 
 void NikonTetherService::addItemToDownloadQueue(CContentContainer* item) {
   item->setDownloadThread(_downloadThreadObj);
-  _thread->runLoop()->post([wrapper = ContentContainerWrapper::wrapperForContentContainer(item)] {
-    _downloadThreadObj->addToDownloadQueue(wrapper);
-  });
+  _downloadThreadObj->homeThread()->runLoop()->post([wrapper = ContentContainerWrapper::wrapperForContentContainer(
+                                                         item)] { _downloadThreadObj->addToDownloadQueue(wrapper); });
 }
 
 std::int32_t NikonTetherService::contentIsReadyToDownload(const std::string& fileName, std::int32_t fileSize,
@@ -230,4 +251,4 @@ void NikonTetherService::fileDownloadComplete(std::int32_t captureId, const std:
   SendMessageToClient(0, "fileDownloadComplete", &table);
 }
 
-const std::string& NikonTetherService::getTemporaryDirectoryPath() const { return gTemporaryDirectoryPath; }
+std::string& NikonTetherService::getTemporaryDirectoryPath() const { return gTemporaryDirectoryPath; }

@@ -8,23 +8,29 @@
 #include <atomic>
 #include <memory>
 #include <string>
+#include <thread>
 #include <vector>
 
+#include "CameraEvents.h"
 #include "KtLuaTableMarshalling.h"
 #include "NikonDownloadThread.h"
 #include "NikonModule.h"
 #include "Thread.h"
 
-class NikonTetherService {
+class NikonTetherService : public CameraEvents {
  public:
   // The one service, made with the first call: loads the modules and starts the download thread. The caller of the
-  // first call owns it. Throws std::system_error when the thread cannot be started. Any thread afterwards.
+  // first call owns it. Throws std::system_error when the thread cannot be started. Any thread afterwards, also after
+  // the end of a service that had to leave its modules behind.
   static NikonTetherService* getSingleton();
-  NikonTetherService(const NikonTetherService&) = delete;
-  NikonTetherService& operator=(const NikonTetherService&) = delete;
   // Closes every SDK object, once a transfer in progress has ended, for which it waits 30 seconds; after that it leaves
-  // the modules to the end of the process. Items still queued are given up. The process ends right after.
-  ~NikonTetherService();
+  // the modules to the end of the process, with no callback of theirs getting through any more. Items still queued are
+  // given up. The process ends right after.
+  ~NikonTetherService() override;
+  // The memory of a service that left its modules behind is not used again: a callback that was in progress may still
+  // use it.
+  static void* operator new(std::size_t size);
+  static void operator delete(void* memory);
 
   void doInitialCameraScan();
   void idle();
@@ -35,18 +41,11 @@ class NikonTetherService {
   void getCameraSettings(int messageId, KtLuaTE* data);
   void doCapture(int messageId, KtLuaTE* data);
 
-  // The next idle pass rescans the modules. Any thread.
-  void doCameraScanOnIdle();
-  // Takes the item over and queues it for the download thread, without waiting. Any thread.
-  void addItemToDownloadQueue(CContentContainer* item);
-
-  // From the one delivery of the process that is being handled, whatever its thread:
-  // announces a file and returns its capture id;
-  std::int32_t contentIsReadyToDownload(const std::string& fileName, std::int32_t fileSize, bool hasSidecar);
-  // announces that the file is complete.
-  void fileDownloadComplete(std::int32_t captureId, const std::string& path);
-  // Where captured files are written. Any thread.
-  const std::string& getTemporaryDirectoryPath() const;
+  void doCameraScanOnIdle() override;
+  void addItemToDownloadQueue(CContentContainer* item) override;
+  std::int32_t contentIsReadyToDownload(const std::string& fileName, std::int32_t fileSize, bool hasSidecar) override;
+  void fileDownloadComplete(std::int32_t captureId, const std::string& path) override;
+  std::string& getTemporaryDirectoryPath() const override;
 
  private:
   NikonTetherService();
@@ -54,15 +53,17 @@ class NikonTetherService {
   CNikonModule* getModuleById(std::int32_t moduleId) const;
   static std::int32_t deviceIdFromTable(KtLuaTE* data);
   void deleteRemovedCameras(CNikonModule& module);
+  bool remove(CCamera* camera);
 
   static NikonTetherService* _singleton;
   static NikonDownloadThread* _downloadThreadObj;  // lives for the rest of the process
-  static std::int32_t _captureId;                  // the last one handed out in the life of the process
+  static bool _modulesLeftBehind;
 
   std::vector<std::unique_ptr<CNikonModule>> _modules;
   CNikonModule* _connectedModule = nullptr;  // the last one that a connect request named
-  std::atomic<bool> _scanOnIdle{false};
-  std::atomic<bool> _scanOnNextIdle{false};  // asked for by another thread, perhaps behind this pass's test
+  std::int32_t _captureId = 0;               // the last one handed out
+  bool _scanOnIdle = false;                  // the main thread's
+  std::atomic<bool> _scanRequested{false};   // by another thread, for the next pass
   std::shared_ptr<platform::Thread> _thread;
-  const std::shared_ptr<platform::Thread> _mainThread = platform::Thread::current();
+  const std::thread::id _mainThread = std::this_thread::get_id();
 };

@@ -154,6 +154,7 @@ TEST(Encoding, StringsEndAtTheirFirstNulAndDataDoesNot) {
   }
   const std::string data = "\4\0\0\0\3\0\0\0\0\xff\0"s;
   EXPECT_EQ(encode(KtLuaTEData(data.data() + 8, 3)), data);
+  EXPECT_THROW(KtLuaTEData(data.data(), -1), int);
   EXPECT_EQ(encode(*decode(data).element), data);
 }
 

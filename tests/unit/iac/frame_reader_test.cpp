@@ -95,6 +95,8 @@ TEST_F(FrameReader, TheFrameEndsWhereItsElementsEndWhateverItsLengthSays) {
   feed(frame(3, kName + kNil, -14));
   feed(frame(4, kName + kNil, -1000));  // a negative length waits for nothing
   EXPECT_EQ(takeIds(), (std::vector<std::int32_t>{1, 2, 3, 4}));
+  ASSERT_EQ(logged.size(), 2U) << "told once until a frame fits again";
+  EXPECT_EQ(logged.front(), "Out of step with the host: a frame with length 40 ended after 18 bytes");
   feed(frame(5, "\x09\0\0\0"s + kNil));
   const auto message = reader->getNextMessage();
   ASSERT_NE(message, nullptr);
@@ -171,6 +173,18 @@ TEST_F(FrameReader, ReadsNoMoreThanItMayKeepUntilItsQueueIsEmptyAgain) {
   for (std::int32_t id = 0; id < kCount; ++id) ASSERT_EQ(ids[static_cast<std::size_t>(id)], id);
 }
 
+TEST_F(FrameReader, WhatCameBeforeTheQueueWasEmptyDoesNotHoldUpWhatComesNow) {
+  const std::string large = frame(1, kName + "\4\0\0\0"s + raw(std::int32_t{60'000}) + std::string(60'000, 'x'));
+  for (std::size_t sent = 0; sent <= kMostWaitingBytes; sent += large.size()) {
+    feed(large);
+    ASSERT_EQ(takeIds().size(), 1U);
+  }
+  RunLoop::current()->runOnce(Clock::now());
+  feed(frame(2, kName + kNil));
+  feed(frame(3, kName + kNil));
+  EXPECT_EQ(takeIds(), (std::vector<std::int32_t>{2, 3}));
+}
+
 TEST_F(FrameReader, AMessageThatMissesTheQueueLockIsQueuedFirstInTheNextPass) {
   auto& lock = KtRCMessageAccumulatorTest::queueLock(*reader);
   std::promise<void> held;
@@ -196,8 +210,11 @@ TEST_F(FrameReader, AMessageThatMissesTheQueueLockIsQueuedFirstInTheNextPass) {
 }
 
 TEST(FrameReaderThread, ReadsOnItsOwnThreadUntilTheEndOrUntilItIsDestroyed) {
-  platform::setLogSink([](const std::string&) {});
   for (const bool closeFirst : {true, false}) {
+    std::promise<void> ended;
+    platform::setLogSink([&](const std::string& line) {
+      if (line == "NSRunLoop thread exit.") ended.set_value();
+    });
     std::array<int, 2> ends{};
     ASSERT_EQ(pipe(ends.data()), 0);
     auto writing = std::make_unique<platform::FileHandle>(ends[1]);
@@ -216,6 +233,7 @@ TEST(FrameReaderThread, ReadsOnItsOwnThreadUntilTheEndOrUntilItIsDestroyed) {
     if (closeFirst) {
       writing.reset();
       finished.get_future().wait();
+      ended.get_future().wait();
     }
   }
   platform::setLogSink(nullptr);

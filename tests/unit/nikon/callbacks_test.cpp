@@ -65,11 +65,17 @@ TEST_F(Callbacks, AnEventDuringTheOpenWaitsUntilTheObjectIsWhole) {
     object.onEvent = [&](std::int32_t event, void*) {
       EXPECT_TRUE(whole);
       heard.push_back(event);
-      if (heard.size() == 1) MAIDEventHandler(object.reference(), 1, 8);
+      if (heard.size() > 1) throw std::int32_t{-116};
+      MAIDEventHandler(object.reference(), 1, 8);
     };
   };
-  new SpyObject(root.get(), 1);
+  EXPECT_NO_THROW(new SpyObject(root.get(), 1));
   EXPECT_EQ(heard, (std::vector<std::int32_t>{0, 1}));
+  EXPECT_EQ(recorder.logged("MAIDEventHandler: -116"), 1U);
+
+  const auto plain = CNikonObject::openModule(Model::entryPoint(), "module");
+  MAIDEventHandler(static_cast<CNikonCallbackReceiver*>(plain.get()), 3, 0);
+  EXPECT_EQ(recorder.traced("Unhandled event: kNkMAIDEvent_WarmedUp"), 1U);
 }
 
 TEST_F(Callbacks, ADeletionWaitsForACallbackInsideOnAnotherThread) {
@@ -86,6 +92,21 @@ TEST_F(Callbacks, ADeletionWaitsForACallbackInsideOnAnotherThread) {
   auto releaser = std::async(std::launch::async, [&] { leave.set_value(); });
   root.reset();
   EXPECT_TRUE(left);
+
+  // One that was kept until the object was whole is inside like any other.
+  std::promise<void> keptEntered;
+  std::promise<void> keptMayLeave;
+  const auto gate = CallbackGate::make(this);
+  gate->keepForLater([&] {
+    keptEntered.set_value();
+    keptMayLeave.get_future().wait();
+    left = false;
+  });
+  auto opener = std::async(std::launch::async, [&] { gate->open(); });
+  keptEntered.get_future().wait();
+  auto keptReleaser = std::async(std::launch::async, [&] { keptMayLeave.set_value(); });
+  gate->close();
+  EXPECT_FALSE(left);
 }
 
 TEST_F(Callbacks, ACompletionCountsOnceAndReachesItsReceiverWithItsContext) {

@@ -67,6 +67,13 @@ TEST_F(DownloadThreadTest, CallbacksAreCarriedToItOnceTheObjectBelongsToIt) {
   EXPECT_EQ(object->lastEvent, 4);
   EXPECT_EQ(recorder.traced("Event Notification"), 0U);
   loop->perform([&] { EXPECT_EQ(MAIDDataHandler(object->reference(), nullptr, nullptr), 5); });
+  // It may be in a call into a module that waits for the callback.
+  loop->perform([&] { std::async(std::launch::async, [&] { MAIDEventHandler(object->reference(), 6, 0); }).get(); });
+  EXPECT_EQ(object->lastEvent, 6);
+  // Or it may be waiting for the lock.
+  const std::lock_guard access(getAsyncLock());
+  EXPECT_EQ(MAIDDataHandler(object->reference(), nullptr, nullptr), 1);
+  EXPECT_EQ(object->thread, std::this_thread::get_id());
 }
 
 TEST_F(DownloadThreadTest, ACallbackOnItsWayWhenTheObjectIsDeletedThereFindsNothing) {
@@ -131,18 +138,51 @@ TEST_F(ServiceTest, ACameraThatGoesWithItemsQueuedAndOneThatNeverCompletesLeaves
   idleUntil("objectWasAdded");
   model.removeCamera(1);
   idleUntil("deviceRemoved");
-  idle();
-  EXPECT_EQ(model.openObjects(), 2U) << "the module and camera 2";
+  idleUntil([&] { return model.openObjects() == 2U; });  // the module and camera 2
   model.camera(2)->shoot(Picture::jpeg(bytes(7)));
   idleUntil("objectWasAdded", 2);
-  model.removeCamera(2);
+  // Of another one, whose data object opens late, nothing ever comes.
+  model.camera(2)->setTransfer({.pollsPerDelivery = 1U << 30});
+  model.faults().add({.level = Level::Data, .item = 2, .command = kNkMAIDCommand_Open, .times = 1, .answer = 152});
+  model.camera(2)->shoot(Picture::jpeg(bytes(7)));
+  idleUntil([&] { return recorder.traced("could not open data type") == 1; });
+  model.camera(2)->setAlive(false);
+  service->doCameraScanOnIdle();
   idleUntil("deviceRemoved", 2);
-  idle();
-  EXPECT_EQ(model.openObjects(), 1U);
+  idleUntil([&] { return model.openObjects() == 1U; });
+  model.removeCamera(2);
   // Its picture was whole, although nothing ever said so.
   EXPECT_EQ(idleUntil("fileDownloadComplete").numbers.at("capture_id"), 2);
   model.addCamera(1, "One").shoot(Picture::jpeg(bytes(7)));
   EXPECT_EQ(idleUntil("fileDownloadComplete", 2).numbers.at("capture_id"), 3);
+}
+
+TEST_F(ServiceTest, ACameraThatIsJudgedGoneFinishesItsTransfersFirstAndHoldsNobodyUp) {
+  auto& camera = model.addCamera(1, "One");
+  camera.setTransfer({.deliveryBytes = 10, .bytesPerSecond = 1});
+  start();
+  for (int shot = 0; shot < 2; ++shot) camera.shoot(Picture::jpeg(bytes(300, shot)));
+  idleUntil("objectWasAdded");
+  camera.setAlive(false);
+  service->doCameraScanOnIdle();
+  idle();
+  EXPECT_EQ(recorder.names(), "deviceAdded objectWasAdded deviceRemoved");
+  camera.setTransfer({});
+  idleUntil([&] { return model.openObjects() == 1U; });
+  EXPECT_EQ(read(recorder.await("fileDownloadComplete", 2).strings.at("file_path")), bytes(300, 1));
+}
+
+TEST_F(ServiceTest, AnItemsEventDuringATransferHoldsNobodyUp) {
+  auto& camera = model.addCamera(1, "One");
+  camera.setTransfer({.deliveryBytes = 10, .bytesPerSecond = 1});
+  start();
+  for (int shot = 0; shot < 2; ++shot) camera.shoot(Picture::jpeg(bytes(1000)));
+  idleUntil("objectWasAdded");
+  camera.raise(2, Level::Item, kNkMAIDEvent_CapChange, 0);
+  idle();
+  EXPECT_EQ(recorder.names(), "deviceAdded objectWasAdded");
+  camera.setTransfer({});
+  idleUntil("fileDownloadComplete", 2);
 }
 
 // In polls of the main thread, and from a thread of the module.

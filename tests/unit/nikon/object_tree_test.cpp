@@ -77,6 +77,29 @@ TEST_F(ObjectTree, AClosedObjectSendsNothingAndIsNoParent) {
   EXPECT_TRUE(model.calls().empty());
 }
 
+TEST_F(ObjectTree, ACallInProgressOnAnotherThreadPutsTheCloseOffAndNoneBeginsAfterIt) {
+  openAll();
+  model.record(true);
+  CNikonObject* const camera = root->openChild(1, "camera");
+  CNikonObject* const item = camera->openChild(1, "item");
+  std::promise<void> inside;
+  std::promise<void> mayReturn;
+  model.beforeCall([&](const virtualcamera::Call& call) {
+    if (call.command != kNkMAIDCommand_Async) return;
+    inside.set_value();
+    mayReturn.get_future().wait();
+  });
+  auto poller = std::async(std::launch::async, [&] { return item->async(); });
+  inside.get_future().wait();
+  item->closeNikonObject();
+  camera->closeNikonObject();
+  EXPECT_FALSE(item->async());
+  EXPECT_TRUE(model.closed().empty());
+  mayReturn.set_value();
+  EXPECT_TRUE(poller.get());
+  EXPECT_EQ(model.closed(), (std::vector<Target>{{Level::Item, 1, 1}, {Level::Camera, 1, 0}}));
+}
+
 TEST_F(ObjectTree, ChildrenAreListedInTheOrderOfTheSdkAndFailuresEmptyTheList) {
   openAll();
   std::vector<std::int32_t> ids;

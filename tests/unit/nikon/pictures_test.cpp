@@ -99,11 +99,24 @@ TEST_F(PictureTest, NothingButDeliveriesOfTheFileInsideItsBoundsReachesTheFile) 
   EXPECT_EQ(files().size(), std::size(table)) << "the repeated last delivery made no file";
 }
 
-TEST_F(PictureTest, ATransferThatBreaksOffIsNotReportedAsComplete) {
+TEST_F(PictureTest, ATransferThatIsRefusedOrBreaksOffIsOneLogLineAndNotReportedAsComplete) {
   faultTransfer({.completionResult = kNkMAIDResult_DataTransFailure, .stopAfter = 2});
-  EXPECT_EQ(completeFilesOf(Picture::jpeg(bytes(30))), 0U);
+  faultTransfer({.answer = kNkMAIDResult_DeviceBusy});
+  faultTransfer({.noCompletion = true, .stopAfter = 1});
+  model.faults().add(
+      {.level = Level::Data, .item = 3, .command = kNkMAIDCommand_Async, .skip = 5, .answer = kNkMAIDResult_BusReset});
+  start();
+  for (int shot = 0; shot < 3; ++shot) camera.shoot(Picture::jpeg(bytes(30)));
+  camera.shoot(Picture::jpeg(bytes(20)));
+  idleUntil("fileDownloadComplete");
+  EXPECT_EQ(read(recorder.await("fileDownloadComplete").strings.at("file_path")), bytes(20));
   EXPECT_EQ(recorder.traced("CContentData completionCallback,failed to finish data transfer, err=141"), 1U);
-  EXPECT_EQ(recorder.await("objectWasAdded").strings.at("file_name"), "Capture0001.jpg");
+  for (const char* line : {"1 of camera 1 (One) broke off: kNkMAIDResult_DataTransFailure",
+                           "2 of camera 1 (One) was refused: kNkMAIDResult_DeviceBusy",
+                           "3 of camera 1 (One) broke off: kNkMAIDResult_BusReset"}) {
+    EXPECT_EQ(recorder.logged(std::string("Transfer of item ") + line), 1U) << line;
+  }
+  EXPECT_EQ(recorder.logged("Transfer of item"), 3U);
 }
 
 TEST_F(PictureTest, AFileThatCannotBeCreatedIsNeitherAddedNorCompleteAndTheNextOneIs) {

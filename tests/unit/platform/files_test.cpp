@@ -12,6 +12,7 @@
 #include "Bundle.h"
 #include "FileHandle.h"
 #include "FileManager.h"
+#include "Log.h"
 #include "MemoryBlock.h"
 #include "NotificationCenter.h"
 
@@ -93,8 +94,12 @@ TEST_F(InFolder, ADanglingLinkIsSomethingAndATemporaryDirectoryThatIsNotThereIsN
   EXPECT_FALSE(FileManager::remove(link));
   setenv("TMPDIR", (folder + "/").c_str(), 1);
   EXPECT_EQ(platform::temporaryDirectory(), folder);
+  std::string logged;
+  platform::setLogSink([&](const std::string& line) { logged = line; });
   setenv("TMPDIR", (folder + "/missing").c_str(), 1);
   EXPECT_TRUE(FileManager::isDirectory(platform::temporaryDirectory()));
+  platform::setLogSink(nullptr);
+  EXPECT_NE(logged.find(folder + "/missing cannot be used: No such file or directory; using "), std::string::npos);
 }
 
 TEST_F(InFolder, RoomIsKeptWithoutChangingTheSizeAndItsLackIsTold) {

@@ -1,7 +1,11 @@
 #include "Thread.h"
 
+#include <fcntl.h>
 #include <gtest/gtest.h>
+#include <unistd.h>
 
+#include <algorithm>
+#include <array>
 #include <future>
 #include <thread>
 
@@ -113,6 +117,31 @@ TEST(Log, ASinkGetsTheTextCutToTheLongestLine) {
   platform::setLogSink(nullptr);
   EXPECT_EQ(line.substr(0, 6), "text x");
   EXPECT_TRUE(line.size() > 3000 && line.size() < 4096) << line.size();
+}
+
+TEST(Log, LinesThatNobodyReadsAreDroppedAndTheNextOneSaysHowMany) {
+  std::array<int, 2> ends{};
+  ASSERT_EQ(pipe(ends.data()), 0);
+  for (const int end : ends) fcntl(end, F_SETFL, O_NONBLOCK);
+  const int before = dup(STDERR_FILENO);
+  dup2(ends[1], STDERR_FILENO);
+  constexpr int kLines = 20'000;
+  for (int number = 0; number < kLines; ++number) platform::log("line");
+  std::string read;
+  const auto readAll = [&] {
+    std::array<char, 65536> chunk{};
+    for (ssize_t count = 0; (count = ::read(ends[0], chunk.data(), chunk.size())) > 0;)
+      read.append(chunk.data(), count);
+    return std::count(read.begin(), read.end(), '\n');
+  };
+  const auto kept = readAll();
+  platform::log("the next");
+  readAll();
+  dup2(before, STDERR_FILENO);
+  for (const int descriptor : {ends[0], ends[1], before}) close(descriptor);
+  EXPECT_LT(kept, kLines);
+  EXPECT_NE(read.find("] " + std::to_string(kLines - kept) + " log lines were dropped here"), std::string::npos);
+  EXPECT_TRUE(read.ends_with("the next\n"));
 }
 
 }  // namespace

@@ -44,7 +44,7 @@ TEST(DeferredCalls, TheClockCountsSecondsFromTheYear2001) {
 
 TEST(UniqueFilePath, NumbersFromTwoBeforeTheExtensionWhateverHasTheName) {
   std::string pattern = ::testing::TempDir() + "tether-unique-XXXXXX";
-  const std::string folder = mkdtemp(pattern.data());
+  std::string folder = mkdtemp(pattern.data());
   const auto expect = [&](const std::string& name, const std::string& unique) {
     EXPECT_EQ(MakeUniqueFilePath(folder, name), folder + "/" + unique);
   };

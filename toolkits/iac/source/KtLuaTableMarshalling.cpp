@@ -125,6 +125,7 @@ KtLuaTE* KtLuaTETable::copy() {
 // Data.
 
 KtLuaTEData::KtLuaTEData(const void* source, std::int32_t count) : KtLuaTE(kKtLuaTypeData), length(count) {
+  if (count < 0) throw -1;
   // Never an empty block: the address is what tells two data keys apart.
   bytes = std::malloc(count > 0 ? static_cast<std::size_t>(count) : 1);
   if (bytes == nullptr) throw -1;

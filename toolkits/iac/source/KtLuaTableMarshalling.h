@@ -139,7 +139,7 @@ class KtLuaTEString final : public KtLuaTE {
 
 class KtLuaTEData final : public KtLuaTE {
  public:
-  // Copies the bytes. Throws the integer -1 when there is no memory for them.
+  // Copies the bytes. Throws the integer -1 for a negative count, and when there is no memory for them.
   KtLuaTEData(const void* source, std::int32_t count);
   explicit KtLuaTEData(std::string_view block) : KtLuaTEData(block.data(), static_cast<std::int32_t>(block.size())) {}
   explicit KtLuaTEData(std::istream& in);

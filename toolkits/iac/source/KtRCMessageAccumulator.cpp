@@ -71,6 +71,7 @@ void KtRCMessageAccumulator::observePipeForData() {
 
 void KtRCMessageAccumulator::dataWasRead(const platform::Notification& notification) {
   if (notification.data->length() == 0) {
+    _sourceFileHandle->stopReading();  // a thread of the reader's own has nothing left to run for
     platform::NotificationCenter::defaultCenter().post({kReadHandleIsFinished, this, nullptr});
     return;
   }
@@ -88,9 +89,9 @@ void KtRCMessageAccumulator::readOn() { _sourceFileHandle->readInBackgroundAndNo
 
 bool KtRCMessageAccumulator::mayReadOn(std::size_t chunk) {
   if (!_callersLoop) return true;
-  const std::unique_lock guard(_messageQueueLock, 0s);
-  if (!guard) return true;  // whoever has it takes a message
-  _bytesSinceEmpty = _waitingMessages.empty() ? 0 : _bytesSinceEmpty + chunk;
+  if (!_messageQueueLock.try_lock_for(0s)) return true;  // whoever has it takes a message
+  const platform::Guard guard(_messageQueueLock, platform::kAdopt);
+  if (!_waitingMessages.empty()) _bytesSinceEmpty += chunk;
   _readingRests = _waitingMessages.size() >= kMostWaitingMessages || _bytesSinceEmpty >= kMostWaitingBytes;
   return !_readingRests;
 }
@@ -178,7 +179,7 @@ void KtRCMessageAccumulator::readElement(Pass& pass, std::unique_ptr<KtLuaTE>& e
     if (_frameConsumed + end - pass.position > kLargestRest) throw KtMalformedElement("runs past 64 MiB");
     _frameConsumed += end - pass.position;
     pass.position = end;
-    ++_currentMessageStage;
+    if (++_currentMessageStage == kQueue) noteStep();
   } catch (const KtStreamError& error) {
     const std::int64_t there = pass.total - pass.position;
     // Not for all that is missing: it is a length's word, and damage behind it shows with fewer bytes. With twice as
@@ -189,6 +190,16 @@ void KtRCMessageAccumulator::readElement(Pass& pass, std::unique_ptr<KtLuaTE>& e
   } catch (const KtMalformedElement& error) {
     dropFrame(pass, error.reason().c_str());
   }
+}
+
+// The frame ends where its elements do; what comes next is most likely not the length of another.
+void KtRCMessageAccumulator::noteStep() {
+  const bool fits = _frameConsumed == _currentMessage->length;
+  if (!fits && !_outOfStep) {
+    platform::log("Out of step with the host: a frame with length %d ended after %lld bytes", _currentMessage->length,
+                  static_cast<long long>(_frameConsumed));
+  }
+  _outOfStep = !fits;
 }
 
 void KtRCMessageAccumulator::dropFrame(Pass& pass, const char* reason) {
@@ -210,30 +221,45 @@ void KtRCMessageAccumulator::startNextMessage() {
 }
 
 void KtRCMessageAccumulator::addMessageToQueue() {
-  std::unique_lock guard(_messageQueueLock, kQueueLockWait);
-  if (!guard) {
+  if (!queueCurrentMessage()) {
     platform::AssertionHandler::current().handleFailureInMethod(
         "addMessageToQueue:", this, "toolkits/iac/source/KtRCMessageAccumulator", 252,
         "KtRemoteCommunicationMac: addMessageToQueue: Message is being lost because we timed out waiting for the queue "
         "lock!");
   }
-  _waitingMessages.push_back(std::move(_currentMessage));
-  guard.unlock();
   startNextMessage();
   platform::NotificationCenter::defaultCenter().post({kMessageIsAvailable, this, nullptr});
 }
 
+bool KtRCMessageAccumulator::queueCurrentMessage() {
+  if (!_messageQueueLock.try_lock_for(kQueueLockWait)) return false;
+  const platform::Guard guard(_messageQueueLock, platform::kAdopt);
+  _waitingMessages.push_back(std::move(_currentMessage));
+  return true;
+}
+
 std::unique_ptr<CRCMessage> KtRCMessageAccumulator::getNextMessage() {
-  const std::unique_lock guard(_messageQueueLock, kQueueLockWait);
-  if (!guard || _waitingMessages.empty()) return nullptr;
+  if (!_messageQueueLock.try_lock_for(kQueueLockWait)) return nullptr;
+  const platform::Guard guard(_messageQueueLock, platform::kAdopt);
+  if (_waitingMessages.empty()) return nullptr;
   auto message = std::move(_waitingMessages.front());
   _waitingMessages.pop_front();
-  if (_waitingMessages.empty() && std::exchange(_readingRests, false)) {
+  if (!_waitingMessages.empty()) return message;
+  _bytesSinceEmpty = 0;
+  if (std::exchange(_readingRests, false)) {
     _callersLoop->post([this, alive = std::weak_ptr(_alive)] {
       if (!alive.expired()) readOn();
     });
   }
   return message;
+}
+
+bool KtRCMessageAccumulator::hasWaiting(std::string_view name) {
+  if (!_messageQueueLock.try_lock_for(kQueueLockWait)) return false;
+  const platform::Guard guard(_messageQueueLock, platform::kAdopt);
+  return std::any_of(_waitingMessages.begin(), _waitingMessages.end(), [&](const auto& message) {
+    return message->name && static_cast<std::string>(*message->name) == name;
+  });
 }
 
 void KtRCMessageAccumulator::startReadThread() {

@@ -2,7 +2,7 @@
 //
 // A frame is a 32-bit length (of what follows), a 32-bit id, the name element and the data element, all little-endian.
 // It ends where the data element's encoding ends, wherever the length field points; the length says how many bytes to
-// wait for before decoding.
+// wait for before decoding. Where the two differ a line in the platform log says so, once until a frame fits again.
 //
 // A frame that can never be decoded, or that is longer than 64 MiB, is dropped with a line in the platform log: what is
 // left of its announced bytes is skipped, and reading goes on with the next frame.
@@ -60,6 +60,8 @@ class KtRCMessageAccumulator {
 
   // The oldest message, or null when there is none or the queue was not to be had within 10 seconds. Any thread.
   std::unique_ptr<CRCMessage> getNextMessage();
+  // Whether a message of that name is in the queue. Any thread.
+  bool hasWaiting(std::string_view name);
 
   // How far the current message has got, and how many bytes wait for its next step. On the reading thread.
   int currentMessageStage() const { return _currentMessageStage; }
@@ -84,15 +86,17 @@ class KtRCMessageAccumulator {
   bool readLength(Pass& pass);
   bool readId(Pass& pass);
   void readElement(Pass& pass, std::unique_ptr<KtLuaTE>& element);
+  void noteStep();
   void dropFrame(Pass& pass, const char* reason);
   void addMessageToQueue();
+  bool queueCurrentMessage();
   void startNextMessage();
   void startReadThread();
 
-  std::deque<std::unique_ptr<CRCMessage>> _waitingMessages;
-  std::size_t _bytesSinceEmpty = 0;  // read since the queue was empty
-  bool _readingRests = false;
   platform::TimedLock _messageQueueLock;
+  std::deque<std::unique_ptr<CRCMessage>> _waitingMessages GUARDED_BY(_messageQueueLock);
+  std::size_t _bytesSinceEmpty GUARDED_BY(_messageQueueLock) = 0;  // read since the queue was empty
+  bool _readingRests GUARDED_BY(_messageQueueLock) = false;
   std::shared_ptr<platform::FileHandle> _sourceFileHandle;
   std::atomic<bool> _keepActiveRunloop{false};
   // Begins at the first byte that the next step needs.
@@ -101,6 +105,7 @@ class KtRCMessageAccumulator {
   std::unique_ptr<CRCMessage> _currentMessage;
   std::int32_t _currentMessageStage = kLength;
 
+  bool _outOfStep = false;          // the last frame did not end where its length said
   std::int64_t _frameConsumed = 0;  // bytes of the current frame behind its length field that are decoded
   std::int64_t _bytesNeeded = 0;    // before the current element is decoded again
   std::int64_t _bytesToSkip = 0;    // of a dropped frame, still to arrive

@@ -2,13 +2,13 @@
 
 #include <memory>
 
-#include "ContentData.h"
 #include "DebugTrace.h"
 #include "Exception.h"
-#include "NikonDownloadThread.h"
+#include "Log.h"
+#include "NameTables.h"
 
 CContentContainer::CContentContainer(CNikonObject* camera, std::int32_t itemId, std::int32_t downloadId)
-    : CNikonThreadedObject(camera, static_cast<std::uint32_t>(itemId), "CContentContainer") {
+    : ContentDataOwner(camera, static_cast<std::uint32_t>(itemId), "CContentContainer") {
   init(downloadId);
   camera->addChild(itemId, this);
   openGate();
@@ -19,7 +19,13 @@ CContentContainer::~CContentContainer() {
   if (inUse()) {
     platform::failAssertion("!_inUse", "~CContentContainer", "plugins/tether_nikon/source/NikonContent", 63);
   }
-  ContentContainerWrapper::clearWrapperOf(*this);
+  const platform::Guard guard(holderLock());
+  if (_holder != nullptr) _holder->forgetItem();
+}
+
+platform::Mutex& CContentContainer::holderLock() {
+  static auto* const lock = new platform::Mutex;
+  return *lock;
 }
 
 void CContentContainer::init(std::int32_t downloadId) {
@@ -47,8 +53,12 @@ std::int32_t CContentContainer::openDataType(std::int32_t dataType) {
 }
 
 std::int32_t CContentContainer::beginDownload() {
-  if (_dataObject == nullptr) openDataType(kNkMAIDDataObjType_Image);
-  if (_dataObject == nullptr) return kNotOpen;
+  const std::int32_t result = _dataObject == nullptr ? openDataType(kNkMAIDDataObjType_Image) : 0;
+  if (_dataObject == nullptr) {
+    platform::log("No image data of %s: %s", description().c_str(),
+                  result == kNotOpen ? "it has none" : errorToName(result));
+    return kNotOpen;
+  }
   _dataObject->startDownload(_name);
   return kNkMAIDResult_NoError;
 }
@@ -56,6 +66,10 @@ std::int32_t CContentContainer::beginDownload() {
 void CContentContainer::contentFinishedDownloading(CContentData* /*data*/) { closeNikonObject(); }
 
 bool CContentContainer::isRawPlusJPEG() const { return _dataObject != nullptr && _dataObject->isRawPlusJPEG(); }
+
+std::string CContentContainer::description() const {
+  return "item " + std::to_string(id()) + " of camera " + std::to_string(parent()->id()) + " (" + _cameraName + ")";
+}
 
 void CContentContainer::setDownloadId(std::int32_t downloadId) {
   _downloadId = downloadId;

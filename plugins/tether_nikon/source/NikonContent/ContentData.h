@@ -6,15 +6,23 @@
 #pragma once
 
 #include <cstdint>
-#include <cstdio>
 #include <map>
-#include <memory>
 #include <string>
 
-#include "MemoryBlock.h"
 #include "NikonThreadedObject.h"
+#include "PictureFile.h"
 
-class CContentContainer;
+class CContentData;
+
+// The item that a data object belongs to, as that knows it.
+class ContentDataOwner : public CNikonThreadedObject {
+ public:
+  using CNikonThreadedObject::CNikonThreadedObject;
+  // The data object has come to its end, well or not.
+  virtual void contentFinishedDownloading(CContentData* data) = 0;
+  // What the log calls the item: "item 3 of camera 1 (Studio)".
+  virtual std::string description() const = 0;
+};
 
 // Base file names by download id. Entries are added and never removed.
 extern std::map<std::int32_t, std::string>& gDownloadIdToNameMap;
@@ -23,7 +31,7 @@ class CContentData : public CNikonThreadedObject {
  public:
   // Opens the data object and enters it into the container. Throws the SDK's result when it cannot be opened; what
   // cannot be read of it is logged.
-  CContentData(CContentContainer* container, std::int32_t dataType, std::int32_t downloadId);
+  CContentData(ContentDataOwner* container, std::int32_t dataType, std::int32_t downloadId);
   ~CContentData() override;
 
   // Starts the transfer and drives the SDK on this thread until it has ended. Without a name the file gets one of its
@@ -33,39 +41,26 @@ class CContentData : public CNikonThreadedObject {
   void completionCallback_thread(std::int32_t command, std::int32_t result, void* context) override;
 
   bool isRawPlusJPEG() const { return _rawPlusJpeg; }
-  void setDownloadId(std::int32_t downloadId) { _downloadId = downloadId; }
-
-  // The buffer of a picture is kept for the next one. Gives it back when there has been none for a while. Any thread.
-  static void giveRestedBufferBack();
+  void setDownloadId(std::int32_t downloadId);
 
  private:
-  struct FileCloser {
-    void operator()(std::FILE* file) const { std::fclose(file); }
-  };
-
   void beginFile(const tagNkMAIDFileInfo& info);
   void makeFileName(std::uint32_t fileDataType);
-  bool openFile();
-  bool takeBuffer();
-  void zeroUpTo(std::size_t end);
-  void store(const tagNkMAIDFileInfo& info, const void* data);
-  void finishFile();
-  void giveFileUp();
   void reportFinishedFile();  // once
+  void logEndWithoutCompletion(std::int32_t startResult);
+  void logFailure(const char* how, const std::string& reason) const;
 
   static std::int32_t _fileNumber;
 
-  [[maybe_unused]] CContentContainer* _container;
+  ContentDataOwner* _container;
   std::int32_t _dataSize = 0;
   bool _rawPlusJpeg = false;
-  std::unique_ptr<std::FILE, FileCloser> _file;  // null before the first delivery and after the last
-  platform::MemoryBlock _buffer;                 // the whole file, in its first _dataSize bytes
-  std::size_t _known = 0;                        // so many bytes of it are delivered ones, or zero
-  bool _finished = false;                        // the file is written
-  bool _reported = false;                        // and the host knows
+  PictureFile _file;       // open from the first delivery to the last
+  bool _finished = false;  // the file is written
+  bool _reported = false;  // and the host knows
   std::int32_t _captureId = 0;
   std::string _fileName;
-  std::string _path;
   std::int32_t _downloadId;
   bool _abandoned = false;  // the file cannot be had: what else is delivered goes nowhere
+  bool _completed = false;
 };

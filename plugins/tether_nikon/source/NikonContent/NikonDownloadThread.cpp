@@ -4,8 +4,9 @@
 #include <utility>
 
 #include "ContentContainer.h"
-#include "ContentData.h"
+#include "Log.h"
 #include "NikonCamera.h"
+#include "PictureFile.h"
 
 namespace {
 
@@ -14,6 +15,7 @@ using namespace std::chrono_literals;
 constexpr auto kQueueInterval = 0.4s;
 constexpr auto kRunLoopSlice = 500ms;
 constexpr auto kAccessLockWait = 30s;
+constexpr auto kAccessLockSlice = 20ms;
 
 // An item in use is not deleted.
 class InUse {
@@ -27,23 +29,13 @@ class InUse {
   CContentContainer& _item;
 };
 
-// Guards what items and wrappers know of each other. The innermost lock: nothing else is taken under it.
-std::mutex& linkLock() {
-  static auto* const lock = new std::mutex;
-  return *lock;
-}
-
 }  // namespace
 
 NikonDownloadThread::NikonDownloadThread() : _asyncLock(getAsyncLock()) {}
 
 void NikonDownloadThread::threadMain() {
   platform::Thread::setCurrentName("Nikon Download Thread");
-  {
-    const std::lock_guard guard(_homeLock);
-    _homeThread = platform::Thread::current();
-    _homeKnown.notify_all();
-  }
+  comeHome();
   platform::Timer timer;
   timer = platform::Timer::repeating(kQueueInterval, [&] { timerTask(timer); });
   while (!platform::Thread::current()->isCancelled()) {
@@ -51,33 +43,40 @@ void NikonDownloadThread::threadMain() {
   }
 }
 
-std::shared_ptr<platform::Thread> NikonDownloadThread::homeThread() {
-  std::unique_lock guard(_homeLock);
-  _homeKnown.wait(guard, [this] { return _homeThread != nullptr; });
-  return _homeThread;
-}
-
 void NikonDownloadThread::timerTask(platform::Timer& timer) {
   if (platform::Thread::current()->isCancelled()) {
     timer.invalidate();
   } else {
     processNextTask();
-    CContentData::giveRestedBufferBack();
+    PictureFile::giveRestedBufferBack();
   }
 }
 
 void NikonDownloadThread::processNextTask() {
-  if (_downloadTaskQueue.empty()) return;
+  if (_downloadTaskQueue.empty() || platform::Thread::current()->isCancelled()) return;
   const auto wrapper = std::move(_downloadTaskQueue.front());
   _downloadTaskQueue.pop_front();
   if (wrapper->contentContainer() == nullptr) return;
-  const std::unique_lock access(_asyncLock, kAccessLockWait);
-  if (!access) return;
+  if (!takeAccessLock()) {
+    platform::log("Dropped %s: the camera modules were busy for 30 seconds", wrapper->description().c_str());
+    return;
+  }
+  const std::unique_lock access(_asyncLock, std::adopt_lock);
   // The item may have gone with its module while the lock was waited for.
   if (CContentContainer* const item = wrapper->contentContainer()) {
     const InUse inUse(*item);
     item->beginDownload();
   }
+}
+
+// Whoever holds the lock may be waiting for a callback that is carried here.
+bool NikonDownloadThread::takeAccessLock() {
+  const auto until = platform::Clock::now() + kAccessLockWait;
+  while (!_asyncLock.try_lock_for(kAccessLockSlice)) {
+    if (platform::Clock::now() >= until) return false;
+    platform::RunLoop::runUrgentCalls();
+  }
+  return true;
 }
 
 void NikonDownloadThread::addToDownloadQueue(std::shared_ptr<ContentContainerWrapper> wrapper) {
@@ -90,42 +89,3 @@ void NikonDownloadThread::removeAllCameraContent(CameraWrapper& wrapper) {
   delete wrapper.camera();
   wrapper.setCamera(nullptr);
 }
-
-// Wrappers.
-
-std::shared_ptr<ContentContainerWrapper> ContentContainerWrapper::wrapperForContentContainer(CContentContainer* item) {
-  return std::make_shared<ContentContainerWrapper>(item);
-}
-
-ContentContainerWrapper::ContentContainerWrapper(CContentContainer* item) : _contentContainer(item) {
-  const std::lock_guard guard(linkLock());
-  if (item != nullptr) item->setWrapper(this);
-}
-
-ContentContainerWrapper::~ContentContainerWrapper() {
-  // Under the lock of all deletions: the item's camera may be about to delete it too.
-  const std::lock_guard deletion(gNikonObjectLock);
-  delete contentContainer();
-}
-
-CContentContainer* ContentContainerWrapper::contentContainer() const {
-  const std::lock_guard guard(linkLock());
-  return _contentContainer;
-}
-
-void ContentContainerWrapper::clearContentContainer() {
-  const std::lock_guard guard(linkLock());
-  if (_contentContainer != nullptr) _contentContainer->setWrapper(nullptr);
-  _contentContainer = nullptr;
-}
-
-void ContentContainerWrapper::clearWrapperOf(const CContentContainer& item) {
-  const std::lock_guard guard(linkLock());
-  if (item.wrapper() != nullptr) item.wrapper()->_contentContainer = nullptr;
-}
-
-std::shared_ptr<CameraWrapper> CameraWrapper::wrapperForCamera(CCamera* camera) {
-  return std::make_shared<CameraWrapper>(camera);
-}
-
-CameraWrapper::~CameraWrapper() { delete _camera; }

@@ -1,7 +1,16 @@
 #include "NikonThreadedObject.h"
 
-#include "NikonDownloadThread.h"
+#include <chrono>
+
 #include "Thread.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+
+constexpr auto kForwardWait = 300ms;
+
+}  // namespace
 
 void CNikonThreadedObject::completionCallback_thread(std::int32_t /*command*/, std::int32_t /*result*/,
                                                      void* /*context*/) {}
@@ -11,7 +20,7 @@ std::int32_t CNikonThreadedObject::dataCallback_thread(void* /*dataInfo*/, void*
 void CNikonThreadedObject::eventNotification_thread(std::int32_t /*event*/, void* /*data*/) {}
 
 bool CNikonThreadedObject::shouldPassToDownloadThread() const {
-  NikonDownloadThread* const thread = _downloadThread;
+  HomeThread* const thread = _downloadThread;
   return thread != nullptr && platform::Thread::current() != thread->homeThread();
 }
 
@@ -68,13 +77,16 @@ MessageForwardPackage MessageForwardPackage::initEventNotificationWithTargetObje
 }
 
 void MessageForwardPackage::performOnDownloadThread() {
-  NikonDownloadThread* const thread = _targetObject->downloadThread();
-  // The object may have given it up meanwhile. And it may wait for the outer callback, which would wait for this one.
-  if (thread == nullptr || CallbackGate::Entry::isNested()) return forwardMessage();
+  HomeThread* const thread = _targetObject->downloadThread();
+  // The object may have given it up meanwhile. It may wait for the outer callback, which would wait for this one, or
+  // for the access lock.
+  if (thread == nullptr || CallbackGate::Entry::isNested() || getAsyncLock().isMine()) return forwardMessage();
   const auto home = thread->homeThread()->runLoop();
   // Whoever deletes the target on the download thread must not wait for this thread, which waits for that one.
   const CallbackGate::StepOut outside(_gate);
-  home->perform([this] { forwardMessage(); });
+  // Urgent: a transfer, which the thread may be waiting for, would keep this one as long as it takes. And not for ever:
+  // the thread may be in a call into a module that waits for this callback.
+  if (!home->performUrgently([this] { forwardMessage(); }, kForwardWait)) forwardMessage();
 }
 
 void MessageForwardPackage::forwardMessage() {

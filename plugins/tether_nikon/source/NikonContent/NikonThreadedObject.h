@@ -1,14 +1,16 @@
 // An SDK object whose callbacks run on the download thread. One that arrives on another thread is carried there, and
-// the delivering thread waits until it has run, so that what the SDK passed stays valid meanwhile.
+// the delivering thread waits until it has run, so that what the SDK passed stays valid meanwhile. A download thread
+// that waits for a transfer runs it between two polls; one that does not get to it in a moment leaves it to the
+// delivering thread.
 //
-// Without a download thread, and from inside another callback, they run where they are delivered.
+// Without a download thread, from inside another callback, and on a thread that holds the SDK access lock, they run
+// where they are delivered.
 #pragma once
 
 #include <atomic>
 
+#include "HomeThread.h"
 #include "NikonObject.h"
-
-class NikonDownloadThread;
 
 class CNikonThreadedObject : public CNikonObject {
  public:
@@ -27,14 +29,14 @@ class CNikonThreadedObject : public CNikonObject {
   virtual void eventNotification_thread(std::int32_t event, void* data);
 
   // Not owned; null for none.
-  void setDownloadThread(NikonDownloadThread* thread) { _downloadThread = thread; }
-  NikonDownloadThread* downloadThread() const { return _downloadThread; }
+  void setDownloadThread(HomeThread* thread) { _downloadThread = thread; }
+  HomeThread* downloadThread() const { return _downloadThread; }
   bool shouldPassToDownloadThread() const;
 
  private:
   friend class MessageForwardPackage;
 
-  std::atomic<NikonDownloadThread*> _downloadThread{nullptr};
+  std::atomic<HomeThread*> _downloadThread{nullptr};
 };
 
 // One callback on its way to the download thread. Owns nothing that it points to.

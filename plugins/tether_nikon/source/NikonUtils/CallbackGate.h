@@ -2,13 +2,14 @@
 // built, while another thread tears it down, and after it has gone. A gate lets none into an object that is not whole.
 #pragma once
 
-#include <condition_variable>
 #include <cstdint>
+#include <deque>
 #include <functional>
 #include <memory>
-#include <mutex>
 #include <thread>
 #include <vector>
+
+#include "Locks.h"
 
 class CallbackGate {
  public:
@@ -17,15 +18,18 @@ class CallbackGate {
   // The gate for a reference, or null when there is none (any more).
   static std::shared_ptr<CallbackGate> find(const void* reference);
 
-  // The object is whole: runs the events that came before, in order, and lets callbacks in from now on.
+  // The object is whole: runs the events that came before, in order, as callbacks inside, and lets others in from now
+  // on.
   void open();
-  // The object goes: lets nothing in any more, forgets the reference, and waits for callbacks that are inside on other
-  // threads. Again: nothing.
+  // The object goes: lets nothing in any more and forgets the reference. Again: nothing.
+  void shut();
+  // As shut(), and waits for callbacks that are inside on other threads.
   void close();
   // Waits for callbacks that are inside on other threads.
   void waitForOthers();
 
-  // Keeps an event that came while the gate was not open yet. False when it is open or closed.
+  // Keeps an event that came while the gate was not open yet. False when it is open or closed. The event must not
+  // throw.
   bool keepForLater(std::function<void()> event);
 
   // A callback's stay inside.
@@ -69,12 +73,12 @@ class CallbackGate {
   explicit CallbackGate(const void* reference) : _reference(reference) {}
   void enter();
   bool leave();
-  bool othersAreInside() const;
+  bool othersAreInside() const REQUIRES(_lock);
 
   const void* const _reference;
-  std::mutex _lock;
-  std::condition_variable _left;
-  State _state = State::starting;
-  std::vector<std::thread::id> _inside;
-  std::vector<std::function<void()>> _early;
+  platform::Mutex _lock;
+  platform::Condition _left;
+  State _state GUARDED_BY(_lock) = State::starting;
+  std::vector<std::thread::id> _inside GUARDED_BY(_lock);
+  std::deque<std::function<void()>> _early GUARDED_BY(_lock);
 };

@@ -1,7 +1,6 @@
 #include "ModuleLoading.h"
 
 #include "Bundle.h"
-#include "NikonObject.h"
 
 std::int32_t CallMAIDEntryPoint(NkMAIDEntryPoint* entryPoint, tagNkMAIDObject* object, std::uint32_t command,
                                 std::uint32_t parameter, std::uint32_t dataType, std::uint64_t data,
@@ -32,15 +31,4 @@ std::int32_t Command_Open(NkMAIDEntryPoint* entryPoint, tagNkMAIDObject* parent,
 bool Command_Close(NkMAIDEntryPoint* entryPoint, tagNkMAIDObject* object) {
   return CallMAIDEntryPoint(entryPoint, object, kNkMAIDCommand_Close, 0, kNkMAIDDataType_Null, 0, nullptr, nullptr) ==
          kNkMAIDResult_NoError;
-}
-
-std::int32_t InitializeNikonModule(NkMAIDEntryPoint* entryPoint, const std::string& name) {
-  try {
-    CNikonObject module(entryPoint, name);
-    module.readCapabilities();
-    module.debugDumpCapabilities();
-    return kNkMAIDResult_NoError;
-  } catch (std::int32_t result) {
-    return result;
-  }
 }

@@ -25,8 +25,5 @@ std::int32_t Command_Open(NkMAIDEntryPoint* entryPoint, tagNkMAIDObject* parent,
 // Closes an object. True on success.
 bool Command_Close(NkMAIDEntryPoint* entryPoint, tagNkMAIDObject* object);
 
-// Opens a module, writes its capability list to the debug log and closes it again. 0, or the SDK's result.
-std::int32_t InitializeNikonModule(NkMAIDEntryPoint* entryPoint, const std::string& name);
-
 // A pointer as the data argument of a call.
 inline std::uint64_t sdkData(const void* pointer) { return reinterpret_cast<std::uintptr_t>(pointer); }

@@ -1,9 +1,9 @@
 #include "NameTables.h"
 
 #include <cstdio>
-#include <mutex>
 
 #include "DebugTrace.h"
+#include "Locks.h"
 #include "MAID.h"
 
 #define ROW(name) \
@@ -86,8 +86,8 @@ const EnumMapEntry ErrorDebugList[] = {ROW(kNkMAIDResult_NotSupported),
 
 namespace {
 
-char unknownValueText[50];
-std::mutex unknownValueLock;  // the text may be overwritten, but never be seen half written without its end
+platform::Mutex unknownValueLock;  // the text may be overwritten, but never be seen half written without its end
+char unknownValueText[50] GUARDED_BY(unknownValueLock);
 
 }  // namespace
 
@@ -96,7 +96,7 @@ const char* enumToName(std::int32_t value, const EnumMapEntry* table) {
     if (row->value == value) return row->name;
     if (row->name == nullptr) break;
   }
-  const std::lock_guard guard(unknownValueLock);
+  const platform::Guard guard(unknownValueLock);
   std::snprintf(unknownValueText, sizeof unknownValueText, "<unknown value: %d>", value);
   return unknownValueText;
 }

@@ -14,10 +14,10 @@ struct Outstanding {
   std::shared_ptr<CallbackGate> gate;
 };
 
-std::mutex outstandingLock;
-std::uintptr_t lastReference = 0;
+platform::Mutex outstandingLock;
+std::uintptr_t lastReference GUARDED_BY(outstandingLock) = 0;
 
-std::unordered_map<std::uintptr_t, Outstanding>& outstanding() {
+std::unordered_map<std::uintptr_t, Outstanding>& outstanding() REQUIRES(outstandingLock) {
   static auto* const all = new std::unordered_map<std::uintptr_t, Outstanding>;
   return *all;
 }
@@ -43,13 +43,13 @@ CNikonCallbackReceiver* receiverOf(void* reference) { return static_cast<CNikonC
 
 void* addCompletionRecord(const CompletionRecord& record) {
   auto gate = CallbackGate::find(record.receiver);
-  const std::lock_guard guard(outstandingLock);
+  const platform::Guard guard(outstandingLock);
   outstanding()[++lastReference] = {record, std::move(gate)};
   return reinterpret_cast<void*>(lastReference);
 }
 
 bool takeCompletionRecord(void* reference, CompletionRecord& record, std::unique_ptr<CallbackGate::Entry>& entry) {
-  const std::lock_guard guard(outstandingLock);
+  const platform::Guard guard(outstandingLock);
   const auto found = outstanding().find(reinterpret_cast<std::uintptr_t>(reference));
   if (found == outstanding().end()) return false;
   record = found->second.record;
@@ -64,7 +64,7 @@ bool takeCompletionRecord(void* reference, CompletionRecord& record, std::unique
 }
 
 void detachCompletionRecord(void* reference) {
-  const std::lock_guard guard(outstandingLock);
+  const platform::Guard guard(outstandingLock);
   outstanding().erase(reinterpret_cast<std::uintptr_t>(reference));
 }
 
@@ -78,7 +78,12 @@ void MAIDEventHandler(void* reference, std::uint32_t event, std::uint64_t data) 
     const CallbackGate::Entry entry(gate);
     if (entry) {
       notify();
-    } else if (!gate->keepForLater(notify)) {
+    } else if (!gate->keepForLater([=] {
+                 guarded("MAIDEventHandler", [&] {
+                   notify();
+                   return 0;
+                 });
+               })) {
       const CallbackGate::Entry late(gate);  // it may have opened in between
       if (late) notify();
     }

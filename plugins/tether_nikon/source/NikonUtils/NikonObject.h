@@ -6,10 +6,10 @@
 #pragma once
 
 #include <atomic>
+#include <chrono>
 #include <cstdint>
 #include <map>
 #include <memory>
-#include <mutex>
 #include <string>
 #include <vector>
 
@@ -17,6 +17,7 @@
 #include "KtLuaTableMarshalling.h"
 #include "Locks.h"
 #include "MAID.h"
+#include "SdkRecord.h"
 
 // What operations report besides the SDK's own results: the object is not open, or a type or layout is not handled,
 inline constexpr std::int32_t kNotOpen = -1;
@@ -47,6 +48,8 @@ class CNikonObject : public CNikonCallbackReceiver {
  public:
   // Opens a module. Throws the SDK's result, a std::int32_t, when that fails. The name is for people only.
   CNikonObject(NkMAIDEntryPoint* entryPoint, const std::string& name);
+  // A module as a plain object, all of it there, callbacks let in. Throws like the constructor.
+  static std::unique_ptr<CNikonObject> openModule(NkMAIDEntryPoint* entryPoint, const std::string& name);
   // Opens a child. The creator enters it into the parent with addChild. Throws like the other; the parent must not be
   // null and must outlive the child.
   CNikonObject(CNikonObject* parentObject, unsigned long id, const char* name);
@@ -68,18 +71,21 @@ class CNikonObject : public CNikonCallbackReceiver {
   void removeChild(CNikonObject* child);
   // The child of that id, opened as a plain object where there is none yet; null when that fails.
   CNikonObject* openChild(std::int32_t id, const char* name);
-  // The SDK object is gone: waits for actions of this object and of all below it end with the next poll, whatever the
-  // SDK says. Any thread.
+  // The SDK object is as good as gone: a wait for an action of this object, or of one below it or yet to be opened
+  // there, is given up when nothing has been delivered for ten seconds from now. Any thread.
   void abandonWaits();
   // Asks the SDK to look for children. An SDK result, or -1.
   std::int32_t enumChildren();
   // The ids that the SDK lists, in its order; none on failure. 0, an SDK result, or -1.
   std::int32_t listChildren(std::vector<std::int32_t>& ids);
 
-  // Closes the SDK object early; what needs it afterwards reports -1. Again: nothing.
+  // Closes the SDK object early; what needs it afterwards reports -1. Where another thread is in a call about it, that
+  // closes it when it is back. Again: nothing.
   void closeNikonObject();
+  // Whether anything opened below it is still there. Any thread.
+  bool hasChildren() const;
   bool checkObject() const { return getObject() != nullptr; }
-  // The SDK's record of the object, null once it is closed; kept alive for a call in progress on another thread.
+  // The SDK's record of the object, null once it is closed. For looking at: calls go through the operations here.
   std::shared_ptr<tagNkMAIDObject> getObject() const;
   std::int32_t id() const { return _objectId; }
   void setInUse(bool inUse) { _inUse = inUse; }
@@ -122,40 +128,60 @@ class CNikonObject : public CNikonCallbackReceiver {
   void openGate() { _gate->open(); }
   // No callback is inside, none comes any more: first thing in the destructor of every class that handles one.
   void closeGate() { _gate->close(); }
+  // No callback of this object or of one below it comes any more. Waits for none.
+  void shutGates();
   bool inUse() const { return _inUse; }
+  // Something of this object has been delivered: a wait for it goes on though it was abandoned. Any thread.
+  void noteDelivery();
+  // What the last poll of this object answered.
+  std::int32_t lastPollResult() const { return _lastPollResult; }
   CNikonObject* parent() const { return _parent; }
 
  private:
-  void closeGatesBelow();
+  // There was no memory for an enumeration's elements; no operation reports it.
+  static constexpr std::int32_t kNoMemory = -2;
+  using Time = std::chrono::steady_clock::rep;  // of the steady clock; 0 for none
+
+  void abandon(Time since);
+  bool isGivenUp() const;
+  std::shared_ptr<SdkRecord> record() const;
+  void closeRecord(std::chrono::milliseconds wait);
   void collectGatesBelow(std::vector<std::shared_ptr<CallbackGate>>& gates) const;
   void init(CNikonObject* parentObject, std::int32_t id);
+  std::int32_t openBelow(const CNikonObject* parentObject, tagNkMAIDObject* object, std::int32_t id);
   void registerCallback(std::int32_t capability, void (*procedure)());
   bool unregisterCallback(std::int32_t capability);
   void deleteChildren();
   CNikonObject* takeNextChild();
   const tagNkMAIDCapInfo* findCapability(std::int32_t capability) const;
   std::int32_t send(std::uint32_t command, std::uint32_t parameter, std::uint32_t dataType, std::uint64_t data);
-  std::int32_t readCapabilitiesOnce();
-  int IdleLoop(const std::atomic<std::uint32_t>& counter, std::uint32_t target);
+  std::int32_t readCapabilitiesOnce(bool& again);
+  int IdleLoop(tagNkMAIDObject* object, const std::atomic<std::uint32_t>* counter, std::uint32_t target);
   std::int32_t readEnumArray(std::int32_t capability, tagNkMAIDEnum& record, std::vector<char>& elements);
   std::int32_t getEnumStringCapability_packed(std::int32_t capability, tagNkMAIDEnum& record, std::string& value);
   std::int32_t getEnumStringCapability_unpacked(std::int32_t capability, tagNkMAIDEnum& record, std::string& value);
   std::unique_ptr<KtLuaTE> getEnumAsTE(std::int32_t capability);
 
-  mutable std::mutex _stateLock;  // guards the record and the children, which two threads use
-  std::shared_ptr<tagNkMAIDObject> _object;
+  // Of an object before those of its children.
+  mutable platform::Mutex _stateLock;
+  std::shared_ptr<SdkRecord> _object GUARDED_BY(_stateLock);
+  std::shared_ptr<SdkRecord> _opened;  // also when it is closed
   CNikonObject* _parent = nullptr;
-  std::map<std::int32_t, CNikonObject*> _children;
-  std::vector<CNikonObject*> _replacedChildren;
+  std::map<std::int32_t, CNikonObject*> _children GUARDED_BY(_stateLock);
+  std::vector<CNikonObject*> _replacedChildren GUARDED_BY(_stateLock);
   std::int32_t _capabilityCount = 0;
   std::unique_ptr<tagNkMAIDCapInfo[]> _capabilities;
   std::int32_t _objectId = 0;
   NkMAIDEntryPoint* _entryPoint;
   std::atomic<bool> _inUse{false};
-  std::atomic<bool> _waitsAbandoned{false};
-  std::atomic<bool> _closed{false};  // and the SDK said so
+  std::atomic<Time> _abandonedSince{0};
+  std::atomic<Time> _lastDelivery{0};  // to this object or to one below it
+  std::atomic<std::int32_t> _lastPollResult{0};
   std::shared_ptr<CallbackGate> _gate;
 };
+
+// Opens a module, writes its capability list to the debug log and closes it again. 0, or the SDK's result.
+std::int32_t InitializeNikonModule(NkMAIDEntryPoint* entryPoint, const std::string& name);
 
 // What the SDK calls back. Each finds its object, hands on, lets no exception through, and answers 0 for an object that
 // is not there.

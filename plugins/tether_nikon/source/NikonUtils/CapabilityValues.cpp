@@ -1,12 +1,10 @@
-// Reading, setting and starting what an object announces.
+// Reading and setting what an object announces.
 
 #include <algorithm>
 #include <cstdio>
 #include <cstring>
-#include <ctime>
 #include <new>
 
-#include "CompletionRecords.h"
 #include "DebugTrace.h"
 #include "ModuleLoading.h"
 #include "NameTables.h"
@@ -16,9 +14,6 @@ namespace {
 
 // How often a list that changes between its count and its reading is read again before that counts as a failure.
 constexpr int kMostListReads = 100;
-constexpr timespec kPollPause{0, 10000};
-// There was no memory for an enumeration's elements; never leaves this file.
-constexpr std::int32_t kNoMemory = -2;
 
 const char* capabilityName(std::int32_t capability) {
   const char* const name = capabilityToName(capability);
@@ -38,23 +33,22 @@ bool isIntegers(const tagNkMAIDEnum& record) {
 
 void CNikonObject::readCapabilities() {
   if (!checkObject()) return;
-  std::int32_t result = kNkMAIDResult_BufferSize;
-  for (int reads = 0; result == kNkMAIDResult_BufferSize && reads < kMostListReads; ++reads) {
-    result = readCapabilitiesOnce();
-  }
+  std::int32_t result = kNkMAIDResult_NoError;
+  bool again = true;
+  for (int reads = 0; again && reads < kMostListReads; ++reads) result = readCapabilitiesOnce(again);
   if (result != kNkMAIDResult_NoError) debugmsgint("Error from kNkMAIDCommand_GetCapInfo: %ld", result);
 }
 
-std::int32_t CNikonObject::readCapabilitiesOnce() {
+std::int32_t CNikonObject::readCapabilitiesOnce(bool& again) {
+  again = false;
   std::uint32_t count = 0;
   std::int32_t result = send(kNkMAIDCommand_GetCapCount, 0, kNkMAIDDataType_UnsignedPtr, sdkData(&count));
-  // A changed size belongs to the reading of the list alone.
-  if (result == kNkMAIDResult_BufferSize) return kNkMAIDResult_UnexpectedError;
   if (result != kNkMAIDResult_NoError) return result;
   if (count * std::uint64_t{sizeof(tagNkMAIDCapInfo)} > kLargestSdkArray) return kNkMAIDResult_OutOfMemory;
   std::unique_ptr<tagNkMAIDCapInfo[]> list(new (std::nothrow) tagNkMAIDCapInfo[count]());
   if (!list) return kNkMAIDResult_OutOfMemory;
   result = send(kNkMAIDCommand_GetCapInfo, count, kNkMAIDDataType_CapInfoPtr, sdkData(list.get()));
+  again = result == kNkMAIDResult_BufferSize;
   if (result != kNkMAIDResult_NoError) return result;
   _capabilityCount = static_cast<std::int32_t>(count);
   _capabilities = std::move(list);
@@ -93,9 +87,9 @@ void CNikonObject::debugDumpCapabilities() {
 
 std::int32_t CNikonObject::send(std::uint32_t command, std::uint32_t parameter, std::uint32_t dataType,
                                 std::uint64_t data) {
-  const auto object = getObject();
-  if (!object) return kNotOpen;
-  return CallMAIDEntryPoint(_entryPoint, object.get(), command, parameter, dataType, data, nullptr, nullptr);
+  const SdkRecord::Call call(record());
+  if (!call) return kNotOpen;
+  return CallMAIDEntryPoint(_entryPoint, call.object(), command, parameter, dataType, data, nullptr, nullptr);
 }
 
 std::int32_t CNikonObject::getCapability(std::int32_t capability, std::uint32_t dataType, std::uint64_t data) {
@@ -288,41 +282,4 @@ std::unique_ptr<KtLuaTE> CNikonObject::getEnumAsTE(std::int32_t capability) {
   debugmsgstr("Unhandled enum type for parameter id: %s", capabilityName(capability));
   debugmsgint("enum type was %d", static_cast<std::int32_t>(record.elementType));
   return nullptr;
-}
-
-// Actions.
-
-std::int32_t CNikonObject::capStart(std::int32_t capability, CNikonCallbackReceiver* receiver, void* context) {
-  const auto object = getObject();
-  if (!object) return kNotOpen;
-  std::atomic<std::uint32_t> counter{0};
-  void* const reference = receiver == nullptr ? nullptr : addCompletionRecord({receiver, context, &counter});
-  const std::int32_t result = CallMAIDEntryPoint(_entryPoint, object.get(), kNkMAIDCommand_CapStart, capability,
-                                                 kNkMAIDDataType_Null, 0, CommandCompletionProc, reference);
-  if (receiver == nullptr) return result;
-  if (result == kNkMAIDResult_NoError || result == kNkMAIDResult_Pending) IdleLoop(counter, 1);
-  // A completion that comes later than this finds nothing; one that has come on another thread is waited for.
-  detachCompletionRecord(reference);
-  if (const auto receiverGate = CallbackGate::find(receiver)) receiverGate->waitForOthers();
-  return result;
-}
-
-int CNikonObject::IdleLoop(const std::atomic<std::uint32_t>& counter, std::uint32_t target) {
-  bool polled = true;
-  while (counter < target && polled && !_waitsAbandoned) {
-    polled = async();
-    nanosleep(&kPollPause, nullptr);
-  }
-  return 1;
-}
-
-bool CNikonObject::async() {
-  const std::int32_t result = send(kNkMAIDCommand_Async, 0, kNkMAIDDataType_Null, 0);
-  return result == kNkMAIDResult_NoError || result == kNkMAIDResult_Pending;
-}
-
-std::int32_t CNikonObject::issueCommand(std::int32_t capability, CNikonCallbackReceiver* receiver, void* context) {
-  if (!hasCapability(capability)) return kNkMAIDResult_NoError;
-  const std::int32_t result = capStart(capability, receiver, context);
-  return result == kNkMAIDResult_Pending ? static_cast<std::int32_t>(kNkMAIDResult_NoError) : result;
 }
