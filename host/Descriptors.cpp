@@ -8,9 +8,7 @@
 #include <system_error>
 
 namespace tether {
-namespace {
 
-// A descriptor of 0 to 2 would be in the way of the child's standard ones.
 Descriptor aboveStandardError(Descriptor low) {
   if (low.get() > STDERR_FILENO) {
     fcntl(low.get(), F_SETFD, FD_CLOEXEC);
@@ -20,8 +18,6 @@ Descriptor aboveStandardError(Descriptor low) {
   if (!high) throw std::system_error(errno, std::generic_category(), "no descriptor to be had");
   return high;
 }
-
-}  // namespace
 
 void Descriptor::reset() {
   if (_descriptor >= 0) close(std::exchange(_descriptor, -1));

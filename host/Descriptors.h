@@ -28,6 +28,10 @@ class Descriptor {
   int _descriptor = -1;
 };
 
+// The same open file under a number above standard error, where it is in the way of no child's standard descriptors.
+// Throws std::system_error when there are no descriptors left.
+Descriptor aboveStandardError(Descriptor low);
+
 struct Pipe {
   Descriptor read;
   Descriptor write;

@@ -1,6 +1,7 @@
 #include "FileMover.h"
 
 #include <fcntl.h>
+#include <sys/file.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -8,6 +9,7 @@
 #include <cerrno>
 #include <cstdlib>
 #include <cstring>
+#include <fstream>
 #include <initializer_list>
 #include <string_view>
 #include <vector>
@@ -19,6 +21,7 @@
 namespace tether {
 namespace {
 
+constexpr const char* kNotRegular = "not a regular file";
 constexpr int kMostNumbers = 100'000;
 constexpr std::size_t kCopyChunk = std::size_t{1} << 20;
 
@@ -37,11 +40,70 @@ std::string bareName(const std::string& name) {
   return bare.empty() || bare == "." || bare == ".." ? "Picture" : bare;
 }
 
-Descriptor makeHidden(std::string& name) {
-  const std::lock_guard guard(spawnLock());
-  Descriptor file(mkstemp(name.data()));
-  if (file) fcntl(file.get(), F_SETFD, FD_CLOEXEC);
-  return file;
+constexpr std::string_view kCopyPrefix = ".tether-copy.";
+constexpr std::string_view kCopySuffix = "XXXXXX";
+
+enum class Hold { kMine, kAnothers, kUnknown };
+
+// A copy is held by whoever makes it, for as long as the process lives.
+Hold hold(const Descriptor& copy) {
+  if (flock(copy.get(), LOCK_EX | LOCK_NB) != 0) return errno == EWOULDBLOCK ? Hold::kAnothers : Hold::kUnknown;
+  struct stat status {};
+  // One that went before it was held.
+  return fstat(copy.get(), &status) == 0 && status.st_nlink > 0 ? Hold::kMine : Hold::kAnothers;
+}
+
+// A fresh file of a hidden name. Where someone took it for a dead one before it was held, another.
+Descriptor makeHidden(const std::string& folder, std::string& path) {
+  for (;;) {
+    path = platform::appendingPathComponent(folder, std::string(kCopyPrefix).append(kCopySuffix));
+    Descriptor file;
+    {
+      const std::lock_guard guard(spawnLock());
+      file = Descriptor(mkstemp(path.data()));
+      if (file) fcntl(file.get(), F_SETFD, FD_CLOEXEC);
+    }
+    if (!file || hold(file) != Hold::kAnothers) return file;
+  }
+}
+
+// Some file systems know no flush of a folder, and some folders may be written but not read.
+bool cannotFlushFolder(int error) { return isOneOf(error, {EINVAL, ENOSYS, ENOTSUP, EOPNOTSUPP, EACCES, EPERM}); }
+
+bool isSame(const std::string& path, const std::string& other) {
+  struct stat one {};
+  struct stat two {};
+  return stat(path.c_str(), &one) == 0 && stat(other.c_str(), &two) == 0 && one.st_dev == two.st_dev &&
+         one.st_ino == two.st_ino;
+}
+
+// "base.jpg", "base-2.jpg" and so on.
+bool isNumbered(std::string_view name, std::string_view base, std::string_view extension) {
+  if (name.size() < base.size() + extension.size() || !name.starts_with(base) || !name.ends_with(extension))
+    return false;
+  const std::string_view number = name.substr(base.size(), name.size() - base.size() - extension.size());
+  return number.empty() || (number.size() > 1 && number.front() == '-' &&
+                            number.find_first_not_of("0123456789", 1) == std::string_view::npos);
+}
+
+// Of two regular files with the same bytes.
+std::optional<std::int64_t> sizeOfSame(const std::string& one, const std::string& other) {
+  struct stat first {};
+  struct stat second {};
+  if (lstat(one.c_str(), &first) != 0 || lstat(other.c_str(), &second) != 0 || !S_ISREG(first.st_mode) ||
+      !S_ISREG(second.st_mode) || first.st_size != second.st_size) {
+    return {};
+  }
+  std::ifstream left(one, std::ios::binary);
+  std::ifstream right(other, std::ios::binary);
+  using Bytes = std::istreambuf_iterator<char>;
+  const bool same = left && right && std::equal(Bytes(left), Bytes(), Bytes(right));
+  return same ? std::optional<std::int64_t>(first.st_size) : std::nullopt;
+}
+
+bool isOnDevice(const std::string& path, dev_t device) {
+  struct stat status {};
+  return stat(path.c_str(), &status) == 0 && status.st_dev == device;
 }
 
 }  // namespace
@@ -58,7 +120,13 @@ ssize_t FileCalls::write(int descriptor, const void* bytes, std::size_t count) {
   return ::write(descriptor, bytes, count);
 }
 
-int FileCalls::flush(int descriptor) { return fsync(descriptor) == 0 ? 0 : errno; }
+int FileCalls::flush(int descriptor) {
+#ifdef F_FULLFSYNC
+  // What fsync() leaves in the disk's own memory there.
+  if (fcntl(descriptor, F_FULLFSYNC) == 0) return 0;
+#endif
+  return fsync(descriptor) == 0 ? 0 : errno;
+}
 
 int FileCalls::remove(const std::string& path) { return unlink(path.c_str()) == 0 ? 0 : errno; }
 
@@ -89,22 +157,24 @@ FileMover::FileMover(std::string folder, FileCalls* calls)
   _mode = 0666U & ~mask;
 }
 
-MovedFile FileMover::move(const std::string& source, const std::string& announced, bool firstOfPair,
-                          const std::optional<std::string>& base) {
+MovedFile FileMover::move(const std::string& source, const std::string& announced, std::optional<std::int64_t> size,
+                          bool firstOfPair, const std::optional<std::string>& base) {
   MovedFile result;
   result.path = source;
-  const auto failed = [&](int error) {
-    result.description = std::strerror(error);
+  const auto failed = [&](const std::string& why) {
+    result.description = why;
     return result;
   };
+  const Descriptor file(open(source.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
   struct stat status {};
-  if (lstat(source.c_str(), &status) != 0) return failed(errno);
-  if (!S_ISREG(status.st_mode)) {
-    result.description = "not a regular file";
-    return result;
-  }
+  if (!file) return failed(errno == ELOOP ? kNotRegular : std::strerror(errno));
+  if (fstat(file.get(), &status) != 0) return failed(std::strerror(errno));
+  if (!S_ISREG(status.st_mode)) return failed(kNotRegular);
   result.size = status.st_size;
-  if (const Descriptor file(open(source.c_str(), O_RDONLY | O_NOFOLLOW | O_CLOEXEC)); file) fchmod(file.get(), _mode);
+  if (size && *size != status.st_size) {
+    return failed("it has " + std::to_string(status.st_size) + " bytes, not the " + std::to_string(*size) +
+                  " announced");
+  }
 
   const std::string bare = bareName(announced);
   const std::string_view plain = platform::deletingPathExtension(bare);
@@ -115,26 +185,74 @@ MovedFile FileMover::move(const std::string& source, const std::string& announce
     }
   }
 
-  int error = place(source, name);
-  if (error == EXDEV) {
-    std::string hidden = platform::appendingPathComponent(_folder, "." + name.file() + ".XXXXXX");
-    error = copy(source, hidden, status.st_size);
-    if (error == 0) {
-      error = place(hidden, name);
-      if (error != 0) _calls->remove(hidden);
-    }
-    if (error == 0) {
-      // The picture has its name; a folder that cannot be flushed does not take that back.
-      flushFolder();
-      const int left = _calls->remove(source);
-      if (left != 0) result.description = "the first copy stays at " + source + ": " + std::strerror(left);
-    }
-  }
-  if (error != 0) return failed(error);
+  int error = isOnDevice(_folder, status.st_dev) ? rename(file, result, name) : EXDEV;
+  if (error == EXDEV) error = copy(file, result, name);
+  if (error != 0) return failed(std::strerror(error) + result.description);
   result.moved = true;
   result.base = name.numbered();
-  result.path = platform::appendingPathComponent(_folder, name.file());
+  result.path = pathOf(name);
   return result;
+}
+
+int FileMover::rename(const Descriptor& file, MovedFile& result, Name& name) {
+  fchmod(file.get(), _mode);
+  int error = _calls->flush(file.get());
+  if (error == 0) error = place(result.path, name);
+  if (error != 0) return error;
+  error = flushFolder();
+  if (error != 0 && placeAs(pathOf(name), result.path) != 0) result.path = pathOf(name);
+  return error;
+}
+
+int FileMover::copy(const Descriptor& file, MovedFile& result, Name& name) {
+  std::string hidden;
+  const Descriptor copied = makeHidden(_folder, hidden);
+  if (!copied) return errno;
+  fchmod(copied.get(), _mode);
+  int error = copyBytes(file.get(), copied.get(), result.size);
+  if (error == 0) error = _calls->flush(copied.get());
+  struct stat status {};
+  if (error == 0 && (fstat(copied.get(), &status) != 0 || status.st_size != result.size)) error = EIO;
+  if (error == 0) error = place(hidden, name);
+  if (error != 0) {
+    _calls->remove(hidden);
+    return error;
+  }
+  error = flushFolder();
+  if (error != 0) {
+    if (_calls->remove(pathOf(name)) != 0) result.description = "; a copy that may not last is at " + pathOf(name);
+    return error;
+  }
+  removeFirst(result, pathOf(name));
+  return 0;
+}
+
+MovedFile& FileMover::removeFirst(MovedFile& moved, const std::string& to) {
+  const int left = _calls->remove(moved.path);
+  if (left != 0) moved.description = "the first copy stays at " + moved.path + ": " + std::strerror(left);
+  moved.moved = true;
+  moved.path = to;
+  return moved;
+}
+
+std::optional<MovedFile> FileMover::finish(const std::string& source, const std::string& announced) {
+  const std::string bare = bareName(announced);
+  const std::string_view base = platform::deletingPathExtension(bare);
+  const std::string_view extension = std::string_view(bare).substr(base.size());
+  for (const std::string& other : platform::FileManager::contents(_folder)) {
+    if (!isNumbered(other, base, extension)) continue;
+    const std::string there = platform::appendingPathComponent(_folder, other);
+    const auto size = sizeOfSame(source, there);
+    if (!size) continue;
+    const Descriptor file(open(there.c_str(), O_RDONLY | O_NOFOLLOW | O_CLOEXEC));
+    if (!file || _calls->flush(file.get()) != 0 || flushFolder() != 0) continue;
+    MovedFile finished;
+    finished.path = source;
+    finished.size = *size;
+    finished.base = platform::deletingPathExtension(other);
+    return removeFirst(finished, there);
+  }
+  return {};
 }
 
 // Gives `from` the first free name.
@@ -156,27 +274,9 @@ int FileMover::placeAs(const std::string& from, const std::string& to) {
   if (!cannotLink(error)) return error;
   const Descriptor reserved(open(to.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600));
   if (!reserved) return errno;
-  if (rename(from.c_str(), to.c_str()) == 0) return 0;
+  if (::rename(from.c_str(), to.c_str()) == 0) return 0;
   error = errno;
   unlink(to.c_str());
-  return error;
-}
-
-// The end of the hidden name is chosen here: one that a killed process left must not be in the way.
-int FileMover::copy(const std::string& source, std::string& hidden, std::int64_t size) {
-  const Descriptor from(open(source.c_str(), O_RDONLY | O_NOFOLLOW | O_CLOEXEC));
-  struct stat status {};
-  if (!from || fstat(from.get(), &status) != 0) return errno;
-  const Descriptor to = makeHidden(hidden);
-  if (!to) return errno;
-  fchmod(to.get(), _mode);
-  int error = copyBytes(from.get(), to.get(), size);
-  if (error == 0) error = _calls->flush(to.get());
-  if (error == 0) {
-    struct stat copied {};
-    if (fstat(to.get(), &copied) != 0 || copied.st_size != size) error = EIO;
-  }
-  if (error != 0) _calls->remove(hidden);
   return error;
 }
 
@@ -199,8 +299,35 @@ int FileMover::copyBytes(int from, int to, std::int64_t size) {
 }
 
 int FileMover::flushFolder() {
+  flushFoldersAbove();
   const Descriptor folder(open(_folder.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-  return folder ? _calls->flush(folder.get()) : errno;
+  const int error = folder ? _calls->flush(folder.get()) : errno;
+  return cannotFlushFolder(error) ? 0 : error;
+}
+
+// The folder may be as new as what is in it. Once, and as far as that can be.
+void FileMover::flushFoldersAbove() {
+  if (std::exchange(_flushedAbove, true)) return;
+  for (std::string above = _folder + "/.."; Descriptor folder{open(above.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC)};
+       above += "/..") {
+    fsync(folder.get());
+    if (isSame(above, above + "/..")) return;
+  }
+}
+
+std::string FileMover::pathOf(const Name& name) const { return platform::appendingPathComponent(_folder, name.file()); }
+
+std::vector<std::string> removeDeadCopies(const std::string& folder) {
+  std::vector<std::string> removed;
+  for (const std::string& name : platform::FileManager::contents(folder)) {
+    if (name.size() != kCopyPrefix.size() + kCopySuffix.size() || !name.starts_with(kCopyPrefix)) continue;
+    std::string path = platform::appendingPathComponent(folder, name);
+    const Descriptor file(open(path.c_str(), O_RDWR | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
+    struct stat status {};
+    const bool ours = file && fstat(file.get(), &status) == 0 && S_ISREG(status.st_mode) && status.st_uid == geteuid();
+    if (ours && hold(file) == Hold::kMine && unlink(path.c_str()) == 0) removed.push_back(std::move(path));
+  }
+  return removed;
 }
 
 }  // namespace tether

@@ -2,9 +2,12 @@
 //
 // Nothing that is in the folder is ever overwritten, and no link in it followed: where a name is taken the file becomes
 // "name-2.jpg", "name-3.jpg" and so on. A file is renamed where that is possible. Into another file system it is copied
-// under a hidden name in the folder, checked for its size, flushed to disk, given its name, the folder flushed, and
-// only then the first copy removed. Whatever goes wrong leaves the first copy where it is and nothing half in the
-// folder; only a process that is killed meanwhile may leave the hidden name there.
+// under a hidden name in the folder, checked for its size, given its name, and only then the first copy removed.
+//
+// Whichever way it goes, its bytes are flushed to the disk before it has its name, and the folder after: what is said
+// to be moved outlasts a loss of power. Whatever goes wrong, a flush too, leaves the file where it was and nothing half
+// in the folder. Only a process that is killed meanwhile may leave the hidden name there; removeDeadCopies() finds
+// those.
 #pragma once
 
 #include <sys/types.h>
@@ -13,6 +16,9 @@
 #include <cstdint>
 #include <optional>
 #include <string>
+#include <vector>
+
+#include "Descriptors.h"
 
 namespace tether {
 
@@ -36,6 +42,10 @@ struct MovedFile {
   std::string description;  // what went wrong; of a moved file, that the first copy could not be removed
 };
 
+// Removes the hidden copies in a folder whose makers were killed; those of processes that live are left alone. Returns
+// the paths of what it removed.
+std::vector<std::string> removeDeadCopies(const std::string& folder);
+
 class FileMover {
  public:
   // Files go to `folder`, which must exist by then. `calls` must outlive the mover; null for the system's own. Reads
@@ -44,27 +54,37 @@ class FileMover {
   FileMover(const FileMover&) = delete;
   FileMover& operator=(const FileMover&) = delete;
 
-  // Moves the regular file `source` (a link is refused) under `name`, of which only what follows the last slash counts.
-  // The first of two files that belong together is given a base that no file in the folder has, whatever its extension
+  // Moves the regular file `source` (a link is refused, and a file of another `size` than the one given) under `name`,
+  // of which only what follows the last slash counts. What is refused is left as it is. The first of two files that
+  // belong together is given a base that no file in the folder has, whatever its extension
   // (`firstOfPair`); the second is asked for under that base and gets it unless its name has been taken since. Blocks
   // for as long as a copy takes. Never throws for what happens in the file system.
-  MovedFile move(const std::string& source, const std::string& name, bool firstOfPair = false,
-                 const std::optional<std::string>& base = std::nullopt);
+  MovedFile move(const std::string& source, const std::string& name, std::optional<std::int64_t> size = std::nullopt,
+                 bool firstOfPair = false, const std::optional<std::string>& base = std::nullopt);
+
+  // Ends a move that was cut off: where the folder has the same bytes already, under a name that move() would give,
+  // they are flushed and the first copy is removed. Nothing where there is no such file.
+  std::optional<MovedFile> finish(const std::string& source, const std::string& name);
 
   const std::string& folder() const { return _folder; }
 
  private:
   struct Name;
+  int rename(const Descriptor& file, MovedFile& result, Name& name);
+  int copy(const Descriptor& file, MovedFile& result, Name& name);
   int place(const std::string& from, Name& name);
   int placeAs(const std::string& from, const std::string& to);
-  int copy(const std::string& source, std::string& hidden, std::int64_t size);
   int copyBytes(int from, int to, std::int64_t size);
   int flushFolder();
+  void flushFoldersAbove();
+  std::string pathOf(const Name& name) const;
+  MovedFile& removeFirst(MovedFile& moved, const std::string& to);
 
   std::string _folder;
   FileCalls _system;
   FileCalls* _calls;
   mode_t _mode;
+  bool _flushedAbove = false;
 };
 
 }  // namespace tether

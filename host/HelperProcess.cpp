@@ -49,6 +49,8 @@ class FileActions {
     posix_spawn_file_actions_adddup2(&_actions, start.error < 0 ? STDERR_FILENO : start.error, STDERR_FILENO);
     posix_spawn_file_actions_adddup2(&_actions, start.input, STDIN_FILENO);
     posix_spawn_file_actions_adddup2(&_actions, start.output, STDOUT_FILENO);
+    // After the others: one of them may have this number here.
+    if (start.inherited >= 0) posix_spawn_file_actions_adddup2(&_actions, start.inherited, STDERR_FILENO + 1);
   }
   FileActions(const FileActions&) = delete;
   FileActions& operator=(const FileActions&) = delete;
@@ -105,7 +107,7 @@ HelperProcess::HelperProcess(const Start& start) {
   }
   if (error != 0) throw HelperNotStarted("cannot start " + start.executable + ": " + std::strerror(error));
   try {
-    _reaper = std::thread([this] { reap(); });
+    _reaper = std::thread([this, ended = start.ended] { reap(ended); });
   } catch (const std::system_error& noThread) {
     kill(_pid, SIGKILL);
     waitpid(_pid, nullptr, 0);
@@ -119,16 +121,19 @@ HelperProcess::~HelperProcess() {
 }
 
 // The child is collected under the lock: as long as no status is known its number belongs to nobody else.
-void HelperProcess::reap() {
+void HelperProcess::reap(const std::function<void()>& ended) {
   siginfo_t ignored{};
   while (waitid(P_PID, static_cast<id_t>(_pid), &ignored, WEXITED | WNOWAIT) != 0 && errno == EINTR) {
   }
-  const std::lock_guard guard(_lock);
-  int status = 0;
-  while (waitpid(_pid, &status, 0) < 0 && errno == EINTR) {
+  {
+    const std::lock_guard guard(_lock);
+    int status = 0;
+    while (waitpid(_pid, &status, 0) < 0 && errno == EINTR) {
+    }
+    _status = status;
+    _changed.notify_all();
   }
-  _status = status;
-  _changed.notify_all();
+  if (ended) ended();
 }
 
 std::optional<int> HelperProcess::waitUntil(Clock::time_point until) {

@@ -5,6 +5,7 @@
 
 #include <chrono>
 #include <condition_variable>
+#include <functional>
 #include <mutex>
 #include <optional>
 #include <stdexcept>
@@ -36,10 +37,15 @@ class HelperProcess {
     int input = -1;
     int output = -1;
     int error = -1;
+    // Becomes the child's descriptor 3, if it is not negative; stays the caller's. Above 2.
+    int inherited = -1;
+    // Called once the child has ended, on a thread of the process's own, at any time until the destructor returns.
+    std::function<void()> ended;
   };
 
   // Starts the child in a process group of its own, so that a Ctrl-C meant for this process is not the child's end,
-  // with no signal blocked or ignored, and with no other descriptor of ours. Throws HelperNotStarted.
+  // with no signal blocked or ignored, and with no other descriptor of ours than the inherited one. Throws
+  // HelperNotStarted.
   explicit HelperProcess(const Start& start);
   HelperProcess(const HelperProcess&) = delete;
   HelperProcess& operator=(const HelperProcess&) = delete;
@@ -55,7 +61,7 @@ class HelperProcess {
   int stop(std::chrono::milliseconds grace);
 
  private:
-  void reap();
+  void reap(const std::function<void()>& ended);
 
   pid_t _pid = -1;
   std::mutex _lock;

@@ -31,7 +31,28 @@ SettingValue settingFrom(KtLuaTE* value) {
   return {};
 }
 
+// What the system adds to each piece of memory, and a table to each of its entries.
+constexpr std::size_t kMemoryPiece = 16;
+constexpr std::size_t kTableEntry = 48 + kMemoryPiece;
+
+std::size_t memoryOf(const KtLuaTE& element) {
+  const std::size_t memory = sizeof(KtLuaTEString) + kMemoryPiece;
+  if (element.getType() == kKtLuaTypeString) return memory + static_cast<std::string>(element).size();
+  if (const auto* const data = dynamic_cast<const KtLuaTEData*>(&element)) {
+    return memory + static_cast<std::size_t>(data->getLength());
+  }
+  const auto* const table = dynamic_cast<const KtLuaTETable*>(&element);
+  if (table == nullptr) return memory;
+  std::size_t sum = memory;
+  for (const auto& [key, value] : table->getEntries()) sum += kTableEntry + memoryOf(*key) + memoryOf(*value);
+  return sum;
+}
+
 }  // namespace
+
+std::size_t memoryOf(const Message& message) {
+  return sizeof message + message.name.size() + 3 * kMemoryPiece + memoryOf(*message.payload);
+}
 
 Message messageFrom(std::unique_ptr<CRCMessage> received) {
   Message message;
@@ -39,7 +60,6 @@ Message messageFrom(std::unique_ptr<CRCMessage> received) {
   if (received->name) message.name = static_cast<std::string>(*received->name);
   message.payload = std::move(received->data);
   if (!message.payload) message.payload = std::make_shared<KtLuaTENil>();
-  message.size = sizeof received->length + static_cast<std::size_t>(std::max(received->length, 0));
   return message;
 }
 
@@ -60,21 +80,23 @@ Settings settingsFrom(const KtLuaTE& payload) {
 
 Event eventFrom(const Message& message) {
   const KtLuaTE& payload = *message.payload;
-  if (message.id != 0) return OtherMessage{message.name};
+  if (message.id != 0) return OtherMessage{message.name, message.id};
   if (message.name == "heartbeat") return Heartbeat{};
   if (message.name == "deviceAdded") return DeviceAdded{integerIn(payload, "device_id"), textIn(payload, "name")};
   if (message.name == "deviceRemoved") return DeviceRemoved{integerIn(payload, "device_id")};
   if (message.name == "cameraSettingsChanged") return SettingsChanged{settingsFrom(payload)};
   if (message.name == "objectWasAdded") {
     constexpr double kLargestExact = 9007199254740992.0;  // 2 to the 53rd
+    auto size = truncated<std::int64_t>(numberIn(payload, "file_size"), kLargestExact);
+    // A helper counts in 32 bits, and does not know that none of them is a sign.
+    if (size < 0 && size >= INT32_MIN) size += std::int64_t{1} << 32;
     return ObjectWasAdded{integerIn(payload, "capture_id"), integerIn(payload, "has_sidecar") != 0,
-                          textIn(payload, "file_name"),
-                          truncated<std::int64_t>(numberIn(payload, "file_size"), kLargestExact)};
+                          textIn(payload, "file_name"), size};
   }
   if (message.name == "fileDownloadComplete") {
     return FileDownloadComplete{integerIn(payload, "capture_id"), textIn(payload, "file_path")};
   }
-  return OtherMessage{message.name};
+  return OtherMessage{message.name, 0};
 }
 
 std::string encodeFrame(std::int32_t id, std::string_view name, const KtLuaTE* payload) {

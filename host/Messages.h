@@ -19,7 +19,6 @@ struct Message {
   std::int32_t id = 0;
   std::string name;
   std::shared_ptr<KtLuaTE> payload;
-  std::size_t size = 0;  // of its frame, in bytes
 };
 
 // The names of the settings, in the order in which Settings holds their values.
@@ -54,6 +53,11 @@ struct Heartbeat {};
 // A message of another name, replies that nobody waits for any more among them.
 struct OtherMessage {
   std::string name;
+  std::int32_t id = 0;
+};
+// A line that the helper wrote to its standard error, without the stamp of its log.
+struct LogLine {
+  std::string text;
 };
 // The helper is of no more use; its process has been ended.
 struct HelperLost {
@@ -68,7 +72,10 @@ struct HelperLost {
 };
 
 using Event = std::variant<DeviceAdded, DeviceRemoved, SettingsChanged, ObjectWasAdded, FileDownloadComplete, Heartbeat,
-                           OtherMessage, HelperLost>;
+                           OtherMessage, LogLine, HelperLost>;
+
+// How much memory a message takes, about.
+std::size_t memoryOf(const Message& message);
 
 Message messageFrom(std::unique_ptr<CRCMessage> received);
 // Never fails: what a payload lacks is 0 or "".

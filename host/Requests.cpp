@@ -33,35 +33,14 @@ std::int32_t Session::send(std::string_view name, const KtLuaTE* payload) {
   return id;
 }
 
-std::optional<Message> Session::takeReply(std::int32_t first, std::int32_t last) {
-  const std::lock_guard guard(_lock);
-  const auto found = std::find_if(_messages.begin(), _messages.end(), [&](const Message& message) {
-    return message.id >= first && message.id <= last && (message.name == "ok" || message.name == "error");
-  });
-  if (found == _messages.end()) return {};
-  Message reply = std::move(*found);
-  _messages.erase(found);
-  _bytes -= reply.size;
-  return reply;
-}
-
 // A reply with an id from `first` to `last`.
 Reply Session::awaitReply(std::int32_t first, std::int32_t last, Clock::time_point until) {
   std::optional<Message> message;
-  std::size_t seen = 0;
-  takeAll(true);
-  // Looks only at what is new: messages are added at the back while this waits, and taken by nobody else.
-  const bool replied = waitFor(until, [&] {
-    for (; seen < _messages.size(); ++seen) {
-      const Message& candidate = _messages[seen];
-      if (candidate.id >= first && candidate.id <= last && (candidate.name == "ok" || candidate.name == "error")) {
-        return true;
-      }
-    }
-    return false;
+  std::size_t passed = 0;
+  waitFor(until, [&] {
+    message = _incoming->takeReply(first, last, passed);
+    return message.has_value();
   });
-  if (replied) message = takeReply(first, last);
-  takeAll(false);
 
   Reply reply;
   if (!message) {
@@ -91,14 +70,8 @@ Reply::Kind Session::awaitListing(Clock::time_point until) {
   for (std::int32_t module = 1; module <= kModules; ++module) {
     last = send("getCameraSettings", devicePayload(module * kModuleStep).get());
   }
-  bool beat = false;
-  const auto listed = [&] {
-    beat = _beatOnce;
-    return beat || std::any_of(_messages.begin(), _messages.end(),
-                               [&](const Message& message) { return message.id >= first && message.id <= last; });
-  };
-  if (waitFor(until, listed)) {
-    if (!beat) takeReply(first, last);
+  std::size_t passed = 0;
+  if (waitFor(until, [&] { return _incoming->beatOnce() || _incoming->takeReply(first, last, passed); })) {
     return Reply::Kind::kOk;
   }
   if (_lost) return Reply::Kind::kLost;

@@ -7,14 +7,13 @@
 #include <algorithm>
 #include <cerrno>
 #include <csignal>
+#include <filesystem>
 
 namespace tether {
 namespace {
 
 using namespace std::chrono_literals;
 
-constexpr std::size_t kMostMessages = 10'000;
-constexpr std::size_t kMostBytes = std::size_t{64} << 20;
 // How long each step of an end may take that the helper did not make by itself.
 constexpr auto kEndStep = 1s;
 constexpr auto kDestructionGrace = 2s;
@@ -52,12 +51,17 @@ class NoPipeSignal {
   bool _wasPending = false;
 };
 
+std::string absolute(const std::string& path) {
+  std::error_code ignored;
+  return path.empty() ? path : std::filesystem::absolute(path, ignored).string();
+}
+
 }  // namespace
 
 Session::Session(const Options& options)
     : _silence(options.silence),
       _wakeup(options.wakeup ? options.wakeup : std::make_shared<Wakeup>()),
-      _heard(Clock::now()) {
+      _directory(std::make_shared<PrivateDirectory>(absolute(options.folder))) {
   start(options);
 }
 
@@ -66,85 +70,62 @@ Session::~Session() { end(kDestructionGrace); }
 void Session::start(const Options& options) {
   Pipe toHelper = Pipe::make();
   Pipe fromHelper = Pipe::make();
-  // The reader is complete before there is a helper: it cannot miss a message, nor the end.
-  _reader =
-      std::make_unique<KtRCMessageAccumulator>(std::make_shared<platform::FileHandle>(fromHelper.read.release()), true);
-  auto& center = platform::NotificationCenter::defaultCenter();
-  auto* const reader = _reader.get();
-  _available = center.addObserver(std::string(kMessageIsAvailable), reader, [this, reader](const auto&) {
-    while (auto received = reader->getNextMessage()) keep(messageFrom(std::move(received)));
-  });
-  _finished = center.addObserver(std::string(kReadHandleIsFinished), reader, [this](const auto&) { noteEndOfInput(); });
+  Pipe logOfHelper = Pipe::make();
+  // The readers are complete before there is a helper: they cannot miss its end.
+  _incoming =
+      std::make_unique<Incoming>(std::move(fromHelper.read), _wakeup, [directory = _directory](const Message& message) {
+        if (message.name != "objectWasAdded" && message.name != "fileDownloadComplete") return;
+        const Event event = eventFrom(message);
+        if (const auto* const object = std::get_if<ObjectWasAdded>(&event)) directory->noteAnnounced(*object);
+        if (const auto* const complete = std::get_if<FileDownloadComplete>(&event)) directory->noteComplete(*complete);
+      });
+  const int target = options.errorDescriptor < 0 ? STDERR_FILENO : options.errorDescriptor;
+  _log = std::make_unique<HelperLog>(std::move(logOfHelper.read), target, _wakeup);
 
   HelperProcess::Start child;
   child.executable = options.helper.empty() ? helperBesideExecutable() : options.helper;
   child.environment = options.environment;
-  child.environment.push_back("TMPDIR=" + _directory.path());
+  child.environment.push_back("TMPDIR=" + _directory->path());
   child.input = toHelper.read.get();
   child.output = fromHelper.write.get();
-  child.error = options.errorDescriptor;
+  child.error = logOfHelper.write.get();
+  // It may write there for a moment after this process is gone.
+  child.inherited = _directory->descriptor();
+  child.ended = [this] {
+    _log->processEnded();
+    _incoming->processEnded();
+  };
   _process = std::make_unique<HelperProcess>(child);
   _input = std::move(toHelper.write);
   setNonBlocking(_input.get());
 }
 
-// On the reading thread.
-void Session::keep(Message message) {
-  std::unique_lock guard(_lock);
-  _heard = Clock::now();
-  const bool beat = message.id == 0 && message.name == "heartbeat";
-  _beatOnce = _beatOnce || beat;
-  // Heartbeats that nobody takes say no more than the last of them.
-  if (beat && !_messages.empty() && _messages.back().name == "heartbeat" && _messages.back().id == 0) return;
-  _room.wait(guard, [this] { return _takesAll || (_messages.size() < kMostMessages && _bytes < kMostBytes); });
-  _heard = Clock::now();
-  _bytes += message.size;
-  _messages.push_back(std::move(message));
-  guard.unlock();
-  _wakeup->ring();
-}
-
-void Session::noteEndOfInput() {
-  {
-    const std::lock_guard guard(_lock);
-    _inputFinished = true;
-  }
-  _wakeup->ring();
-}
-
 std::optional<Message> Session::nextMessage(Clock::time_point until) {
-  if (!waitFor(until, [this] { return !_messages.empty(); })) return {};
-  const std::lock_guard guard(_lock);
-  Message message = std::move(_messages.front());
-  _messages.pop_front();
-  _bytes -= message.size;
-  _room.notify_one();
-  return message;
+  if (!waitFor(until, [this] { return !_incoming->empty() || _wakeup->takeNudge(); })) return {};
+  return _incoming->take();
 }
 
 std::optional<Event> Session::nextEvent(Clock::time_point until) {
-  if (const auto message = nextMessage(until)) return eventFrom(*message);
+  waitFor(until, [this] { return !_log->empty() || !_incoming->empty() || _wakeup->takeNudge(); });
+  if (const auto line = _log->take()) return *line;
+  if (const auto message = _incoming->take()) return eventFrom(*message);
   if (_lost) return *_lost;
   return {};
 }
 
-// Waits until `done`, which is called with the lock held. False when the time is over, the wait was interrupted, or the
-// helper is lost and so nothing more will come.
+// Waits until `done`. False when the time is over, the wait was interrupted, or the helper is lost and so nothing more
+// will come.
 bool Session::waitFor(Clock::time_point until, const Done& done) {
   for (;;) {
-    bool finished = false;
-    {
-      const std::lock_guard guard(_lock);
-      if (done()) return true;
-      finished = _inputFinished;
-    }
+    const bool finished = _incoming->finished();
+    if (done()) return true;
     if (_lost) return false;
     if (finished) {
       lose(HelperLost::How::kEnded);
       continue;
     }
     if (_wakeup->interrupted() || Clock::now() >= until) return false;
-    const Clock::time_point silent = silentAt();
+    const Clock::time_point silent = std::max(_incoming->heard(), _notSilentBefore) + _silence;
     if (isSilent(silent)) {
       lose(HelperLost::How::kSilent);
       continue;
@@ -153,19 +134,13 @@ bool Session::waitFor(Clock::time_point until, const Done& done) {
   }
 }
 
-Clock::time_point Session::silentAt() {
-  const std::lock_guard guard(_lock);
-  return _heard + _silence;
-}
-
 // A process that was stopped, or a machine that slept, finds the time gone without the helper having had it.
 bool Session::isSilent(Clock::time_point expected) {
   const auto late = Clock::now() - expected;
   if (late < 0s) return false;
-  const std::lock_guard guard(_lock);
-  const bool heardMeanwhile = _heard + _silence > expected;
+  const bool heardMeanwhile = _incoming->heard() + _silence > expected;
   if (!heardMeanwhile && late < kAsleep) return true;
-  _heard = std::max(_heard, Clock::now() - _silence + kAsleep);
+  _notSilentBefore = Clock::now() - _silence + kAsleep;
   return false;
 }
 
@@ -190,28 +165,14 @@ void Session::lose(HelperLost::How how) {
   _lost = std::move(lost);
 }
 
-// What a process wrote before its end may still be in the pipe.
+// What a process wrote before its end may still be in the pipes.
 void Session::readToTheEnd() {
-  const auto finished = [this] {
-    const std::lock_guard guard(_lock);
-    return _inputFinished;
-  };
-  takeAll(true);
-  for (const auto until = Clock::now() + kEndStep; _reader && !finished() && Clock::now() < until;) {
-    _wakeup->waitUntil(until);
-  }
-}
-
-void Session::takeAll(bool all) {
-  {
-    const std::lock_guard guard(_lock);
-    _takesAll = all;
-  }
-  _room.notify_one();
+  const auto until = Clock::now() + kEndStep;
+  _log->waitUntilFinished(until);
+  _incoming->waitUntilFinished(until);
 }
 
 int Session::end(std::chrono::milliseconds grace) {
-  takeAll(true);
   std::optional<int> status = _process->waitUntil(Clock::now());
   if (!status && _input && !_lost) {
     const auto until = Clock::now() + grace;
@@ -222,9 +183,6 @@ int Session::end(std::chrono::milliseconds grace) {
   if (!status) status = _process->stop(kEndStep);
 
   readToTheEnd();
-  _available.remove();
-  _finished.remove();
-  _reader.reset();
   if (!_lost)
     _lost = HelperLost{HelperLost::How::kEnded, *status, "the helper ended (" + describeStatus(*status) + ")"};
   return *status;

@@ -1,28 +1,28 @@
 // A running helper and the conversation with it: requests out, replies matched by id, everything else as messages or
 // typed events in the order in which it came.
 //
-// One thread uses a session and waits in it; a thread of the session's own reads the pipe. Every wait is bounded by a
+// One thread uses a session and waits in it; threads of the session's own read the pipes. Every wait is bounded by a
 // time of the caller's and ends early when the helper is lost or the session's Wakeup is interrupted.
 //
 // A helper is lost when its process ends or closes its output, when nothing has come from it for too long, or when it
 // does not take what is sent. Its process is ended then. Messages that came before can still be had, and after them
 // HelperLost; there is no way back, a new session starts a new helper.
 //
-// Messages that nobody takes are kept up to a bound (10,000 or 64 MiB); beyond it the helper is made to wait.
+// Messages that nobody takes are kept up to 64 MiB of memory; beyond it the helper is made to wait, also where a reply
+// is waited for behind them.
 #pragma once
 
 #include <chrono>
-#include <condition_variable>
-#include <deque>
 #include <functional>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
 
+#include "HelperLog.h"
 #include "HelperProcess.h"
+#include "Incoming.h"
 #include "Messages.h"
 #include "PrivateDirectory.h"
 #include "Wakeup.h"
@@ -32,7 +32,11 @@ namespace tether {
 struct SessionOptions {
   std::string helper;                    // path of its executable; "" for the one beside this executable
   std::vector<std::string> environment;  // NAME=value, for the helper alone
-  int errorDescriptor = -1;              // the helper's standard error; -1: this process's own
+  // What the helper logs is passed on to this one; -1: this process's standard error. The session neither waits for it
+  // nor closes it.
+  int errorDescriptor = -1;
+  // Where its pictures are meant to go, for whoever finds them when this process was killed; "" where that is open.
+  std::string folder;
   // Silence that counts as lost. A helper is busy, and silent, while a camera exposes or a camera is taken down.
   std::chrono::milliseconds silence{60'000};
   std::shared_ptr<Wakeup> wakeup;  // null: one of its own
@@ -55,18 +59,23 @@ class Session {
   explicit Session(const Options& options);
   Session(const Session&) = delete;
   Session& operator=(const Session&) = delete;
-  // As end() with a short grace. No process is left, and no directory unless files are in it.
+  // As end() with a short grace. No process is left, and no directory unless files are in it or others still hold it.
   ~Session();
 
-  // Where the helper leaves its pictures until someone takes them away. Lives as long as the session.
-  const PrivateDirectory& directory() const { return _directory; }
+  // Where the helper leaves its pictures until someone takes them away. May outlive the session.
+  const std::shared_ptr<const PrivateDirectory>& directory() const { return _directory; }
   pid_t processId() const { return _process->pid(); }
 
   // The next message, replies that nobody waited for among them; nothing when none came in time or the wait was
-  // interrupted, and nothing at once when the helper is lost and every message taken.
+  // interrupted or the wakeup nudged, and nothing at once when the helper is lost and every message taken.
   std::optional<Message> nextMessage(Clock::time_point until);
-  // The same as a typed event. A lost helper gives HelperLost, again at every call.
+  // The same as a typed event, and lines of the helper's log among them as they come, before the messages that wait: a
+  // line tells why something is about to be missed. Of lines that nobody takes the last 100 are kept. A lost helper
+  // gives HelperLost, again at every call.
   std::optional<Event> nextEvent(Clock::time_point until);
+  // The last lines of the helper's log, at most 100, the oldest first, whether nextEvent() gave them or not. Any
+  // thread.
+  std::vector<LogLine> lastLogLines() const { return _log->lastLines(); }
   // How the helper was lost, once that is known.
   const std::optional<HelperLost>& lost() const { return _lost; }
 
@@ -99,39 +108,23 @@ class Session {
   using Done = std::function<bool()>;
 
   void start(const Options& options);
-  void keep(Message message);
-  void noteEndOfInput();
   bool waitFor(Clock::time_point until, const Done& done);
-  Clock::time_point silentAt();
   bool isSilent(Clock::time_point expected);
   void lose(HelperLost::How how);
   void readToTheEnd();
-  void takeAll(bool all);
-  std::optional<Message> takeReply(std::int32_t first, std::int32_t last);
   Reply awaitReply(std::int32_t first, std::int32_t last, Clock::time_point until);
   bool writeAll(std::string_view bytes, Clock::time_point until);
 
   const std::chrono::milliseconds _silence;
   std::shared_ptr<Wakeup> _wakeup;
-  PrivateDirectory _directory;
+  std::shared_ptr<const PrivateDirectory> _directory;
+  std::unique_ptr<Incoming> _incoming;
+  std::unique_ptr<HelperLog> _log;
   Descriptor _input;  // the helper's
   std::unique_ptr<HelperProcess> _process;
   std::optional<HelperLost> _lost;
+  Clock::time_point _notSilentBefore;
   std::int32_t _nextId = 1;
-
-  // Shared with the reading thread.
-  std::mutex _lock;
-  std::condition_variable _room;
-  std::deque<Message> _messages;
-  std::size_t _bytes = 0;       // of the messages' frames
-  bool _takesAll = false;       // the bound is off: someone waits for a reply, or for the end
-  bool _inputFinished = false;  // the helper's output is at its end
-  bool _beatOnce = false;
-  Clock::time_point _heard;
-
-  std::unique_ptr<KtRCMessageAccumulator> _reader;
-  platform::Observer _available;
-  platform::Observer _finished;
 };
 
 }  // namespace tether

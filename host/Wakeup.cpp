@@ -35,14 +35,32 @@ void Wakeup::interrupt() noexcept {
   ring();
 }
 
-void Wakeup::waitUntil(Clock::time_point until) {
+void Wakeup::nudge() noexcept {
+  _nudged = true;
+  ring();
+}
+
+void Wakeup::waitUntil(Clock::time_point until) { pollUntil(until, -1); }
+
+bool Wakeup::waitUntilWritable(int descriptor, Clock::time_point until) {
+  while (!pollUntil(until, descriptor)) {
+    // Rings are of no account: who waits for one looks for its reason first.
+    if (interrupted() || Clock::now() >= until) return false;
+  }
+  return true;
+}
+
+// One poll; takes the rings. Whether the descriptor, if it is one, is ready.
+bool Wakeup::pollUntil(Clock::time_point until, int writable) {
   const auto now = Clock::now();
   const auto left = std::clamp<Clock::duration>(until - std::min(now, until), 0s, kLongestPoll);
-  pollfd ready{_pipe.read.get(), POLLIN, 0};
-  poll(&ready, 1, static_cast<int>(std::chrono::ceil<std::chrono::milliseconds>(left).count()));
+  std::array<pollfd, 2> ready{{{_pipe.read.get(), POLLIN, 0}, {writable, POLLOUT, 0}}};
+  const int result =
+      poll(ready.data(), ready.size(), static_cast<int>(std::chrono::ceil<std::chrono::milliseconds>(left).count()));
   std::array<char, 256> bytes{};
   while (read(_pipe.read.get(), bytes.data(), bytes.size()) > 0) {
   }
+  return result > 0 && ready[1].revents != 0;
 }
 
 }  // namespace tether

@@ -26,6 +26,7 @@ struct Picture {
   bool opens = true;
   bool knownPair = true;                       // its data object opens at once, and tells
   std::pair<std::size_t, std::size_t> hole{};  // bytes that no delivery brings
+  bool sent = false;                           // the camera has sent all of it, although it does not arrive whole
   int downloadId = 0;
   std::string fault{};  // as camera.json has it
 };
@@ -35,7 +36,8 @@ struct Camera {
   double device = 0;
   std::string folder{};
   bool plugged = false;
-  bool seen = false;  // the host was told
+  bool seen = false;   // the host was told
+  bool known = false;  // the helper has seen it before: what came since is not on its card
   int battery = 0;
   Pictures held{};  // what its folder has
   // Since it was plugged in.

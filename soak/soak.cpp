@@ -55,6 +55,7 @@ class Soak {
   void shoot();
   void plugIn(Camera& camera);
   void pull(Camera& camera);
+  void remove(Camera& camera, const std::string& file);
   void trouble(bool folderGone);
 
   void until(const std::string& what, const std::function<bool()>& met);
@@ -177,7 +178,6 @@ void Soak::prepare(Camera& camera, const Pictures& pictures, std::size_t faulty,
   }
   const std::size_t deliveryBytes = bytesPerSecond != 0 ? 1000 : oneOf<std::size_t>({2000, 50'000, 1 << 20});
   for (Picture& picture : order) {
-    camera.held[picture.file] = picture;
     Picture hit = picture;
     fault(hit, camera.items + 1, deliveryBytes);
     if (faulty != 0 && oneIn(faulty) && (&picture != &order.back() || hit.fate == Fate::whole)) {
@@ -185,6 +185,7 @@ void Soak::prepare(Camera& camera, const Pictures& pictures, std::size_t faulty,
       faults += (faults.empty() ? "" : ",\n") + hit.fault;
       ++model_.figures.failures;
     }
+    camera.held[picture.file] = picture;
     camera.expect(picture);
   }
   camera.battery = static_cast<int>(number(0, 100));
@@ -203,6 +204,7 @@ void Soak::fault(Picture& picture, unsigned item, std::size_t deliveryBytes) {
     bool opens = true;
     bool knownPair = true;
     std::pair<std::size_t, std::size_t> hole{};  // where it begins, how long it is
+    bool sent = false;
   };
   const std::size_t deliveries = (picture.size + deliveryBytes - 1) / deliveryBytes;
   const std::size_t piece = number(0, deliveries - 1);
@@ -215,8 +217,8 @@ void Soak::fault(Picture& picture, unsigned item, std::size_t deliveryBytes) {
       {R"("object": "data", )" + open, Fate::unseen, true, false},
       {R"("object": "data", "times": 1, )" + open, Fate::whole, true, false},  // the download thread opens it
       {acquire + R"("stopAfter": )" + std::to_string(piece), piece > 0 ? Fate::begun : Fate::unseen},
-      {drops + std::to_string(deliveries - 1) + "}", lost},
-      {drops + "0}", deliveries > 1 ? Fate::whole : lost, true, true, {0, std::min(deliveryBytes, picture.size)}},
+      {drops + std::to_string(deliveries - 1) + "}", lost, true, true, {}, true},
+      {drops + "0}", deliveries > 1 ? Fate::whole : lost, true, true, {0, std::min(deliveryBytes, picture.size)}, true},
       {acquire + R"("delivery": {"twice": true, "count": )" + std::to_string(deliveries) + "}"},
       {acquire + R"("ownThread": true)"},
       {acquire + R"("completion": {"twice": true})"},
@@ -227,6 +229,7 @@ void Soak::fault(Picture& picture, unsigned item, std::size_t deliveryBytes) {
   picture.opens = kind.opens;
   picture.knownPair = kind.knownPair;
   picture.hole = kind.hole;
+  picture.sent = kind.sent;
   picture.fault = "{" + kind.text + R"(, "item": )" + std::to_string(item) + "}";
 }
 
@@ -307,18 +310,23 @@ void Soak::sendAnything(std::size_t requests, bool busy) {
   }
 }
 
-// With pictures that were taken while the camera was out of sight, or were not transferred the last time.
+// With pictures on its card; later with those that were taken while it was out of sight, or not sent the last time.
 void Soak::plugIn(Camera& camera) {
-  const bool first = step_ == 1;  // brings what is made once: buffers, the module's thread
   Pictures pictures = make(oneIn(4) ? number(50, 200) : number(1, 10), true);
   put(camera, pictures);
   pictures.insert(camera.held.begin(), camera.held.end());
-  prepare(camera, pictures, first ? 0 : kUsual, 0,
-          first ? R"({"object": "data", "command": "CapStart", "ownThread": true})" : "");
+  prepare(camera, camera.known ? pictures : Pictures());
   const fs::path drawer = model_.folderOf(camera);
   camera.plugged = true;
   fs::rename(drawer, model_.folderOf(camera));
   until("deviceAdded", [&] { return camera.seen; });
+  camera.known = true;
+  if (step_ != 1) return;
+  // Brings what is made once: buffers, the module's thread.
+  pictures = make(number(1, 10), false);
+  prepare(camera, pictures, 0, 0, R"({"object": "data", "command": "CapStart", "ownThread": true})");
+  settle();
+  put(camera, pictures);
 }
 
 void Soak::pull(Camera& camera) {
@@ -328,8 +336,15 @@ void Soak::pull(Camera& camera) {
   until("deviceRemoved", [&] { return !camera.seen; });
   settle();
   model_.forget(camera);
-  fs::remove_all(model_.folderOf(camera) / "roll");
-  std::erase_if(camera.held, [](const auto& held) { return held.first.starts_with("roll/"); });
+  const Pictures held = camera.held;
+  for (const auto& [file, picture] : held)
+    if (picture.sent || file.starts_with("roll/")) remove(camera, file);
+}
+
+// It will not come, or not be known whether it does.
+void Soak::remove(Camera& camera, const std::string& file) {
+  fs::remove(model_.folderOf(camera) / file);
+  camera.held.erase(file);
 }
 
 // For a while there is no room for large files, or no folder.
@@ -339,13 +354,13 @@ void Soak::trouble(bool folderGone) {
   prepare(camera, pictures, 0);
   settle();
   const rlim_t room = std::max(number(50'000, 200'000), camera.due.back().size);
-  std::size_t lost = 0;
+  std::vector<std::string> lost;
   for (Picture& picture : camera.due) {
     if (!folderGone && picture.size <= room) continue;
     picture.fate = folderGone ? Fate::unseen : Fate::begun;
-    ++lost;
+    lost.push_back(picture.file);
   }
-  model_.figures.failures += static_cast<unsigned>(lost);
+  model_.figures.failures += static_cast<unsigned>(lost.size());
   const auto limit = [&](rlim_t bytes) {
     const rlimit both{bytes, RLIM_INFINITY};
     require(prlimit(helper_.pid(), RLIMIT_FSIZE, &both, nullptr) == 0, "the system takes no limit");
@@ -355,7 +370,7 @@ void Soak::trouble(bool folderGone) {
   if (folderGone) {
     fs::rename(helper_.temporary(), away);
     put(camera, pictures);
-    until("log lines", [&] { return loggedLosses() >= before + lost; });
+    until("log lines", [&] { return loggedLosses() >= before + lost.size(); });
     settle();
     camera.due.clear();
     fs::rename(away, helper_.temporary());
@@ -365,7 +380,8 @@ void Soak::trouble(bool folderGone) {
     until("end of what is due", [&] { return model_.nothingDue(); });
     limit(RLIM_INFINITY);
   }
-  require(loggedLosses() == before + lost, "not one log line for each lost picture");
+  for (const std::string& file : lost) remove(camera, file);
+  require(loggedLosses() == before + lost.size(), "not one log line for each lost picture");
   require(fs::is_empty(helper_.temporary()), "a file stays of a picture that could not be written");
 }
 

@@ -1,7 +1,6 @@
 #include <algorithm>
 
 #include "Commands.h"
-#include "Link.h"
 #include "Pictures.h"
 
 namespace tether::command {
@@ -9,8 +8,11 @@ namespace {
 
 using namespace std::chrono_literals;
 
-constexpr auto kEndGrace = 5s;
 constexpr auto kStatusStep = 200ms;
+// A shutter of a series that is this late moves those after it.
+constexpr auto kLate = 100ms;
+// After so many in a row that brought nothing the others would be fired for nothing, too.
+constexpr int kMostFailures = 10;
 
 // One run of the command.
 class Capture {
@@ -18,155 +20,150 @@ class Capture {
   Capture(const Options& options, Console& console, const std::shared_ptr<Wakeup>& wakeup)
       : _options(options),
         _console(console),
-        _pictures(options.output, console),
         _link(options, console, wakeup),
+        _pictures(options, console, _link, wakeup, true),
         _count(options.count.value_or(1)) {}
 
-  int run() {
+  Outcome run() {
+    Failure end{kSuccess, ""};
     try {
       _link.start();
       connect();
-      _begun = Clock::now();
       while (!isDone()) step();
+      end.text = _gaveUp;
     } catch (const Failure& failure) {
-      finish(failure.status);
-      if (failure.status == kInterrupted || missing().empty()) throw;
-      throw Failure{failure.status, failure.text.empty() ? missing() : failure.text + "; " + missing()};
+      end = failure;
     }
-    finish(kSuccess);
-    if (_pictures.notSaved() > 0) return kNotSaved;
-    if (_lost > 0) throw Failure{kHelperLost, missing()};
-    return _console.closed() ? kUnwritable : kSuccess;
+    Outcome outcome;
+    outcome.status = _pictures.finish(end);
+    outcome.error = end.text;
+    const std::string missing = missingText(end.status == kInterrupted ? shots().counts().shutters : _count);
+    if (!missing.empty()) outcome.error += (end.text.empty() ? "" : "; ") + missing;
+    outcome.details = countsJson(shots().counts());
+    if (outcome.status == kSuccess && _console.closed()) outcome.status = kUnwritable;
+    return outcome;
   }
 
  private:
-  int done() const { return _pictures.done() - _earlier; }
-  int outstanding() const { return std::max(0, _released - _lost - done()); }
+  const Shots& shots() const { return _pictures.shots(); }
+  bool isLast() const { return shots().counts().shutters >= _count || !_gaveUp.empty() || _gone; }
 
-  bool isDone() const {
-    const bool allReleased = _released >= _count || _pictures.notSaved() > 0;
-    return allReleased && outstanding() == 0 && _pictures.underWay() == 0;
+  bool isDone() {
+    if (_gaveUp.empty() && shots().counts().failedInARow >= kMostFailures) {
+      _gaveUp = std::to_string(kMostFailures) + " shutters in a row brought no picture";
+    }
+    const bool over = isLast() && _pictures.isSettled();
+    // What a camera that has gone still sends is waited for, but not for long.
+    if (_gone && (over || Clock::now() >= *_gone + _link.timeout())) throwGone();
+    return over;
   }
 
-  Clock::time_point nextShutter() const {
-    if (_released >= _count || _pictures.notSaved() > 0 || _console.closed()) return Clock::time_point::max();
-    if (_options.every) return _begun + *_options.every * _released;
-    return outstanding() == 0 ? Clock::time_point::min() : Clock::time_point::max();
-  }
+  [[noreturn]] void throwGone() const { throw Failure{kNoCamera, _camera.name + " has gone"}; }
+
+  // When the next shutter is due, whether it may be released by then or not.
+  Clock::time_point due() const { return isLast() ? Clock::time_point::max() : _due; }
 
   void step() {
-    if (Clock::now() >= nextShutter()) release();
-    const bool waiting = outstanding() > 0 || _pictures.underWay() > 0;
-    const auto deadline =
-        waiting ? std::max(_lastRelease, _pictures.lastProgress()) + _link.timeout() : Clock::time_point::max();
-    auto until = std::min(deadline, nextShutter());
+    const auto now = Clock::now();
+    auto until = due();
+    if (now >= until) {
+      if (shots().mayRelease(_options.every.has_value(), now)) {
+        release(now);
+        return;
+      }
+      until = Clock::time_point::max();
+    }
     if (_console.live()) {
       showStatus();
-      until = std::min(until, Clock::now() + kStatusStep);
+      until = std::min(until, now + kStatusStep);
     }
-    const auto event = _link.next(until);
-    if (event) {
-      handle(*event);
-    } else if (Clock::now() >= deadline) {
-      throw Failure{kTimeout, "nothing came from " + _camera.name + " for " + secondsText(_link.timeout())};
-    }
+    if (const auto event = _pictures.next(until)) handle(*event);
   }
 
-  void release() {
-    _lastRelease = Clock::now();
-    ++_released;
-    _pictures.shutterReleased();
-    _link.session().send("doCapture");
+  // A shutter that had to wait is not made up for: those after it keep their distance.
+  void release(Clock::time_point now) {
+    if (!_pictures.releaseShutter()) {
+      if (const auto event = _pictures.next(now)) handle(*event);
+      return;
+    }
+    if (now > _due + kLate) _due = now;
+    _due += _options.every.value_or(0s);
   }
 
   void handle(const Event& event) {
-    _pictures.take(event, _camera);
     const auto* const removed = std::get_if<DeviceRemoved>(&event);
-    if (removed != nullptr && removed->device_id == _camera.id) {
-      throw Failure{kNoCamera, _camera.name + " has gone"};
-    }
+    if (removed != nullptr && removed->device_id == _camera.id) _gone = Clock::now();
     if (const auto* const lost = std::get_if<HelperLost>(&event)) startAgain(*lost);
   }
 
   // A picture that was lost is not taken again: whether to expose once more is the photographer's to say.
   void startAgain(const HelperLost& lost) {
-    _pictures.giveUp(lost.description);
-    _lost += outstanding();
-    if (_released >= _count) throw Failure{kHelperLost, lost.description};
-    _link.restart(lost);
+    _pictures.restart(lost);
+    if (isLast()) return;
     connect();
   }
 
-  // What the camera had already when it was connected is saved too, but is none of the pictures asked for.
   void connect() {
-    const int before = _pictures.done();
     while (!tryToConnect()) {
     }
-    _earlier += _pictures.done() - before;
   }
 
   // False when the helper was lost meanwhile, and there is a new one.
   bool tryToConnect() {
     try {
-      _camera = _link.choose([this](const Event& event) { _pictures.take(event, std::nullopt); });
+      _camera = _link.choose([this](const Event& event) { _pictures.take(event); });
       _link.connect(_camera);
-      const auto until = [this] {
-        return _pictures.underWay() > 0 ? _pictures.lastProgress() + _link.timeout() : Clock::now();
-      };
-      while (const auto event = _link.next(until())) {
-        if (const auto* const lost = std::get_if<HelperLost>(&*event)) throw Failure{kHelperLost, lost->description};
-        handle(*event);
+      _pictures.connected();
+      // Whatever the camera had before comes now, and none of it is a shutter's.
+      while (!_pictures.isSettled()) {
+        const auto event = _pictures.next(Clock::time_point::max());
+        const auto* const lost = event ? std::get_if<HelperLost>(&*event) : nullptr;
+        if (lost != nullptr) throw Failure{kHelperLost, lost->description};
+        if (event) handle(*event);
+        if (_gone) throwGone();
       }
+      _due = Clock::now();
       return true;
     } catch (const Failure& failure) {
-      if (failure.status != kHelperLost) throw;
-      _pictures.giveUp(failure.text);
-      _link.restart(HelperLost(*_link.session().lost()));
+      if (failure.status != kHelperLost || !_link.session().lost()) throw;
+      _pictures.restart(HelperLost(*_link.session().lost()));
       return false;
     }
   }
 
   void showStatus() {
     std::string text = _pictures.status();
-    if (text.empty() && outstanding() > 0) {
-      text = "Waiting for " + _camera.name + " " + secondsText(Clock::now() - _lastRelease);
-    } else if (text.empty()) {
-      text = "Next picture in " + secondsText(std::max<Clock::duration>(nextShutter() - Clock::now(), 0s));
+    if (const auto since = shots().waitingSince(); text.empty() && since) {
+      text = "Waiting for " + _camera.name + " " + secondsText(Clock::now() - *since);
+    } else if (text.empty() && !isLast()) {
+      text = "Next picture in " + secondsText(std::max<Clock::duration>(_due - Clock::now(), 0s));
     }
     _console.status(text);
   }
 
-  void finish(int status) {
-    if (status == kInterrupted || status == kUnwritable) _pictures.waitBriefly(_link);
-    _link.finishing();
-    _link.end(kEndGrace, [this](const Event& event) { _pictures.take(event, _camera); });
-    _pictures.giveUp("the helper has ended");
-  }
-
-  // What of the pictures asked for is not there, in words.
-  std::string missing() const {
-    const int there = std::min(_count, done());
-    if (there >= _count) return {};
-    return std::to_string(_count - there) + " of " + std::to_string(_count) +
-           (_count == 1 ? " picture is missing" : " pictures are missing");
+  // What of so many pictures is not there, in words.
+  std::string missingText(int asked) const {
+    const Shots::Tally& own = shots().counts().own;
+    const int missing = asked - own.saved - own.notSaved;
+    if (missing <= 0 || shots().counts().shutters == 0) return {};
+    return std::to_string(missing) + " of " + std::to_string(asked) +
+           (asked == 1 ? " picture is missing" : " pictures are missing");
   }
 
   const Options& _options;
   Console& _console;
-  Pictures _pictures;
   Link _link;
+  Pictures _pictures;
   const int _count;
   Camera _camera;
-  Clock::time_point _begun;
-  Clock::time_point _lastRelease;
-  int _released = 0;
-  int _lost = 0;
-  int _earlier = 0;
+  Clock::time_point _due;
+  std::optional<Clock::time_point> _gone;  // when the camera went
+  std::string _gaveUp;                     // why no more shutters are sent
 };
 
 }  // namespace
 
-int runCapture(const Options& options, Console& console, const std::shared_ptr<Wakeup>& wakeup) {
+Outcome runCapture(const Options& options, Console& console, const std::shared_ptr<Wakeup>& wakeup) {
   return Capture(options, console, wakeup).run();
 }
 

@@ -6,6 +6,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <climits>
 #include <cstdlib>
 #include <cstring>
 #include <string_view>
@@ -13,26 +14,15 @@
 namespace tether::command {
 namespace {
 
+using namespace std::chrono_literals;
+
+// How long output is waited for that nobody may read any more.
+constexpr auto kMoment = 500ms;
 constexpr std::size_t kUsualWidth = 80;
 
 bool isLiveTerminal() {
   const char* const kind = std::getenv("TERM");
   return isatty(STDERR_FILENO) == 1 && kind != nullptr && std::string_view(kind) != "dumb";
-}
-
-bool writeAll(int descriptor, std::string_view text) {
-  while (!text.empty()) {
-    const ssize_t written = write(descriptor, text.data(), text.size());
-    if (written < 0 && errno == EAGAIN) {
-      // Whoever shares the descriptor may have made it one that does not wait.
-      pollfd ready{descriptor, POLLOUT, 0};
-      poll(&ready, 1, -1);
-    } else if (written < 0 && errno != EINTR) {
-      return false;
-    }
-    if (written > 0) text.remove_prefix(static_cast<std::size_t>(written));
-  }
-  return true;
 }
 
 // At most so many characters of UTF-8 text.
@@ -47,7 +37,7 @@ std::string cut(const std::string& text, std::size_t width) {
 
 }  // namespace
 
-Console::Console(bool json) : _json(json), _live(isLiveTerminal()) {}
+Console::Console(bool json, Wakeup& wakeup) : _json(json), _live(isLiveTerminal()), _wakeup(wakeup) {}
 
 Console::~Console() { status(""); }
 
@@ -65,8 +55,8 @@ void Console::writeLine(std::string line) {
   line += '\n';
   if (_closed || writeAll(STDOUT_FILENO, line)) return;
   _closed = true;
-  // A reader that has seen enough is no fault.
-  if (errno == EPIPE) return;
+  // A reader that has seen enough is no fault, nor one that is not waited for.
+  if (errno == EPIPE || errno == ECANCELED) return;
   writeAll(STDERR_FILENO, std::string("tether: cannot write to standard output: ") + std::strerror(errno) + "\n");
 }
 
@@ -87,6 +77,29 @@ void Console::replaceStatus(const std::string& text) {
   const bool known = ioctl(STDERR_FILENO, TIOCGWINSZ, &size) == 0 && size.ws_col > 1;
   writeAll(STDERR_FILENO, "\r\033[K" + cut(printable(text), known ? size.ws_col - 1U : kUsualWidth - 1));
   _shown = text;
+}
+
+bool Console::writeAll(int descriptor, std::string_view text) {
+  while (!text.empty()) {
+    if (!waitFor(descriptor)) {
+      errno = ECANCELED;
+      return false;
+    }
+    // A pipe that is ready takes so much without a wait.
+    const ssize_t written = write(descriptor, text.data(), std::min<std::size_t>(text.size(), PIPE_BUF));
+    if (written < 0 && errno != EINTR && errno != EAGAIN && errno != EWOULDBLOCK) return false;
+    if (written > 0) text.remove_prefix(static_cast<std::size_t>(written));
+  }
+  return true;
+}
+
+bool Console::waitFor(int descriptor) {
+  const bool patient = !_wakeup.everInterrupted();
+  if (std::this_thread::get_id() == _thread) {
+    return _wakeup.waitUntilWritable(descriptor, patient ? Clock::time_point::max() : Clock::now() + kMoment);
+  }
+  pollfd ready{descriptor, POLLOUT, 0};
+  return poll(&ready, 1, static_cast<int>(std::chrono::milliseconds(kMoment).count())) > 0;
 }
 
 }  // namespace tether::command

@@ -1,18 +1,25 @@
 // Where the command writes: results to standard output, one line at a time; words about its course to standard error;
 // and, where that is a terminal, one live line that later output replaces. Any thread.
+//
+// A reader that takes nothing for a while is waited for, until the user interrupts: what is to be said then and later
+// is given up when it is not taken within a moment.
 #pragma once
 
 #include <atomic>
 #include <mutex>
 #include <string>
+#include <string_view>
+#include <thread>
 
 #include "Text.h"
+#include "Wakeup.h"
 
 namespace tether::command {
 
 class Console {
  public:
-  explicit Console(bool json);
+  // Made on the thread that waits in the wakeup, which outlives the console.
+  Console(bool json, Wakeup& wakeup);
   // Clears the live line.
   ~Console();
   Console(const Console&) = delete;
@@ -35,9 +42,13 @@ class Console {
  private:
   void writeLine(std::string line);
   void replaceStatus(const std::string& text);
+  bool writeAll(int descriptor, std::string_view text);
+  bool waitFor(int descriptor);
 
   const bool _json;
   const bool _live;
+  Wakeup& _wakeup;
+  const std::thread::id _thread = std::this_thread::get_id();
   std::atomic<bool> _closed{false};
   std::mutex _lock;  // held for one line
   std::string _shown;

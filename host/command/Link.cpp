@@ -8,6 +8,8 @@
 #include <cstring>
 #include <system_error>
 
+#include "Report.h"
+
 namespace tether::command {
 namespace {
 
@@ -17,6 +19,11 @@ constexpr auto kDefaultTimeout = 30s;
 constexpr auto kSilenceBeyondTimeout = std::chrono::milliseconds(10s);
 // A module may find its cameras only when it is first polled, a second after the start.
 constexpr auto kCameraPatience = 3s;
+// The first look at the cameras is due a second after the start, which was before the first answer; a request takes
+// another 0.1 seconds to be carried out.
+constexpr auto kFirstPass = 950ms;
+// The part of a device's id that names the camera within its module; no camera has 0 there.
+constexpr std::int32_t kCameraBits = 0xff;
 constexpr std::size_t kMostLosses = 3;
 constexpr auto kLossWindow = 60s;
 constexpr auto kEndGrace = 2s;
@@ -28,22 +35,31 @@ void dropEvent(const Event&) {}
 Link::Link(const Options& options, Console& console, std::shared_ptr<Wakeup> wakeup)
     : _options(options), _console(console), _wakeup(std::move(wakeup)) {
   if (options.helperLog == "-") return;
-  const std::string path = options.helperLog.empty() ? "/dev/null" : options.helperLog;
-  _log = Descriptor(open(path.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0666));
-  if (!_log) throw Failure{kUsage, "cannot write " + path + ": " + std::strerror(errno)};
+  try {
+    _log = openForLog(options.helperLog.empty() ? "/dev/null" : options.helperLog);
+  } catch (const std::system_error& problem) {
+    const bool exhausted = problem.code().value() == EMFILE || problem.code().value() == ENFILE;
+    throw Failure{exhausted ? kHelperLost : kUsage, std::string("cannot write ") + problem.what()};
+  }
 }
 
-Link::~Link() { end(kEndGrace, dropEvent); }
+Link::~Link() {
+  end(kEndGrace, dropEvent);
+  tidy();
+}
 
 std::chrono::milliseconds Link::timeout() const { return _options.timeout.value_or(kDefaultTimeout); }
 
 void Link::start() {
   _cameras.clear();
-  _session.reset();
+  _onlyCamera.reset();
+  _hadAny = false;
+  _probed.reset();
   SessionOptions options;
   options.helper = _options.helper;
   options.errorDescriptor = _log.get();
   options.wakeup = _wakeup;
+  options.folder = _options.output;
   // Who expects exposures that long expects a helper to be busy with them that long.
   options.silence = std::max(options.silence, timeout() + kSilenceBeyondTimeout);
   _startedAt = Clock::now();
@@ -60,22 +76,33 @@ void Link::restart(const HelperLost& lost) {
   const auto now = Clock::now();
   while (!_losses.empty() && now - _losses.front() > kLossWindow) _losses.pop_front();
   _losses.push_back(now);
-  _console.result("", {{"event", "helper_lost"}, {"description", lost.description}});
   if (_losses.size() > kMostLosses) {
     throw Failure{kHelperLost, lost.description + ", too often within a minute; giving up"};
   }
   _console.say(lost.description + "; starting it again");
-  end(0s, dropEvent);
   start();
-  _console.result("", {{"event", "helper_started"}});
+  _console.result("", eventJson("helper_started"));
 }
 
 void Link::end(std::chrono::milliseconds grace, const Take& take) {
   if (!_session) return;
   _session->end(grace);
-  while (const auto message = _session->nextMessage(Clock::now())) take(eventFrom(*message));
-  for (const std::string& path : _session->directory().tidy()) _console.say("left where it is: " + path);
+  for (auto event = _session->nextEvent(Clock::now()); event && !std::holds_alternative<HelperLost>(*event);
+       event = _session->nextEvent(Clock::now())) {
+    take(*event);
+  }
+  _ended.push_back(_session->directory());
   _session.reset();
+}
+
+void Link::tidy(const std::set<std::string>& known) {
+  for (const auto& directory : std::exchange(_ended, {})) {
+    for (const std::string& path : directory->tidy()) {
+      if (known.count(path) > 0) continue;
+      Report::leftover(_console, "left", path, path, "");
+      _console.say("left where it is: " + path);
+    }
+  }
 }
 
 void Link::finishing() {
@@ -90,6 +117,7 @@ void Link::throwIfStopped() const {
 
 std::optional<Event> Link::next(Clock::time_point until) {
   throwIfStopped();
+  if (!_session) return {};
   auto event = _session->nextEvent(until);
   if (event) {
     note(*event);
@@ -100,32 +128,50 @@ std::optional<Event> Link::next(Clock::time_point until) {
 }
 
 void Link::note(const Event& event) {
-  if (const auto* const added = std::get_if<DeviceAdded>(&event)) _cameras[added->device_id] = added->name;
-  if (const auto* const removed = std::get_if<DeviceRemoved>(&event)) _cameras.erase(removed->device_id);
+  if (const auto* const added = std::get_if<DeviceAdded>(&event)) {
+    _cameras[added->device_id] = added->name;
+    const bool known = _onlyCamera && _onlyCamera->id == added->device_id && _onlyCamera->name == added->name;
+    if (!known) _onlyCamera.reset();
+    if (!_hadAny) _onlyCamera = Camera{added->device_id, added->name};
+    _hadAny = true;
+  }
+  if (const auto* const removed = std::get_if<DeviceRemoved>(&event)) {
+    const auto found = _cameras.find(removed->device_id);
+    const std::string number = std::to_string(removed->device_id);
+    _lastRemoved = {removed->device_id, found == _cameras.end() ? "camera " + number : found->second};
+    _cameras.erase(removed->device_id);
+  }
 }
 
+// Digits are an id, and never a name: another camera of the same name is none of this user's.
 bool Link::isWanted(const Camera& camera) const {
-  if (_options.camera.empty() || camera.name == _options.camera) return true;
-  return std::to_string(camera.id) == _options.camera || (!_chosenName.empty() && camera.name == _chosenName);
+  const std::string& asked = _options.camera;
+  if (asked.empty()) return true;
+  if (asked.find_first_not_of("0123456789") != std::string::npos) return camera.name == asked;
+  const std::size_t zeros = std::min(asked.find_first_not_of('0'), asked.size() - 1);
+  return std::to_string(camera.id) == asked.substr(zeros);
 }
 
-// The one of that id before one of that name, and the one that was chosen before, or its like, before any.
 std::optional<Camera> Link::wanted() const {
-  std::optional<Camera> found;
+  std::vector<Camera> found;
+  std::vector<Camera> alike;
   for (const auto& [id, name] : _cameras) {
     const Camera camera{id, name};
-    if (std::to_string(id) == _options.camera) return camera;
     if (!isWanted(camera)) continue;
-    const bool known = name == _chosenName && found && found->name != _chosenName;
-    if (!found || known) found = camera;
+    if (_chosen && id == _chosen->id && name == _chosen->name) return camera;
+    if (_chosen && name == _chosen->name) alike.push_back(camera);
+    found.push_back(camera);
   }
-  return found;
+  // Another of its name may be the same one under another id, if there is but one.
+  if (_chosen) return alike.size() == 1 ? std::optional(alike.front()) : std::nullopt;
+  return found.empty() ? std::nullopt : std::optional(found.front());
 }
 
 Camera Link::choose(const Take& take) {
   Reply reply;
   reply.kind = _session->awaitListing(Clock::now() + timeout());
   if (reply.kind != Reply::Kind::kOk) fail(reply, "the list of cameras");
+  _firstPassBy = Clock::now() + kFirstPass;
   const auto patience = _startedAt + kCameraPatience;
   const auto takeNext = [&](Clock::time_point until) {
     const auto event = next(until);
@@ -146,6 +192,7 @@ Camera Link::choose(const Take& take) {
 
 void Link::failWithoutCamera() const {
   if (_cameras.empty()) throw Failure{kNoCamera, "there is no camera"};
+  if (_chosen) throw Failure{kNoCamera, _chosen->name + " has not come back"};
   std::string known;
   for (const auto& [id, name] : _cameras) {
     known += (known.empty() ? "" : ", ") + std::to_string(id) + " (" + name + ")";
@@ -154,9 +201,16 @@ void Link::failWithoutCamera() const {
 }
 
 void Link::connect(const Camera& camera) {
+  _probed.reset();
   const Reply reply = _session->connect(camera.id, Clock::now() + timeout());
   if (reply.kind != Reply::Kind::kOk) fail(reply, "connecting " + camera.name);
-  _chosenName = camera.name;
+  _chosen = camera;
+  _probed = camera.id & ~kCameraBits;
+}
+
+std::optional<std::int32_t> Link::probe() {
+  if (!canProbe()) return {};
+  return _session->send("getCameraSettings", devicePayload(*_probed).get());
 }
 
 void Link::fail(const Reply& reply, const std::string& what) const {

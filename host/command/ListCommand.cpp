@@ -3,14 +3,17 @@
 
 namespace tether::command {
 
-int runList(const Options& options, Console& console, const std::shared_ptr<Wakeup>& wakeup) {
+Outcome runList(const Options& options, Console& console, const std::shared_ptr<Wakeup>& wakeup) {
   Link link(options, console, wakeup);
   link.start();
   link.choose([](const Event&) {});
   for (const auto& [id, name] : link.cameras()) {
-    console.result(std::to_string(id) + "  " + name, {{"device_id", id}, {"name", name}});
+    Json object = eventJson("camera");
+    object["device_id"] = id;
+    object["camera"] = name;
+    console.result(std::to_string(id) + "  " + name, object);
   }
-  return console.closed() ? kUnwritable : kSuccess;
+  return {console.closed() ? kUnwritable : kSuccess, "", {}};
 }
 
 }  // namespace tether::command

@@ -13,7 +13,11 @@ void show(Console& console, const Message& message) {
   std::string text = message.name.empty() ? "(no name)" : message.name;
   if (message.id != 0) text += " #" + std::to_string(message.id);
   if (!payload.is_null()) text += " " + payload.dump(-1, ' ', false, Json::error_handler_t::replace);
-  console.result(text, {{"name", message.name}, {"id", message.id}, {"payload", payload}});
+  Json object = eventJson("message");
+  object["message"] = message.name;
+  object["id"] = message.id;
+  object["payload"] = payload;
+  console.result(text, object);
 }
 
 // Shows messages until the count or the time is reached; false when the time was, and a count was asked for.
@@ -39,7 +43,7 @@ bool showMessages(const Options& options, Console& console, Wakeup& wakeup, Sess
 
 }  // namespace
 
-int runMessages(const Options& options, Console& console, const std::shared_ptr<Wakeup>& wakeup) {
+Outcome runMessages(const Options& options, Console& console, const std::shared_ptr<Wakeup>& wakeup) {
   Link link(options, console, wakeup);
   link.start();
   if (!options.send.empty()) {
@@ -49,7 +53,7 @@ int runMessages(const Options& options, Console& console, const std::shared_ptr<
   const bool enough = showMessages(options, console, *wakeup, link.session());
   link.end(kEndGrace, [](const Event&) {});
   if (!enough) throw Failure{kTimeout, "fewer messages came than asked for"};
-  return kSuccess;
+  return {};
 }
 
 }  // namespace tether::command

@@ -5,6 +5,8 @@
 #include <optional>
 #include <string>
 
+#include "Text.h"
+
 namespace tether::command {
 
 // Exit statuses.
@@ -34,6 +36,13 @@ struct Options {
 struct Failure {
   int status;
   std::string text;
+};
+
+// How a command ended, for the last line that it prints.
+struct Outcome {
+  int status = kSuccess;
+  std::string error;  // "" when all is well, or when everything was said
+  Json details;       // of this command, merged into that line; null for none
 };
 
 }  // namespace tether::command

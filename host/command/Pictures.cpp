@@ -1,5 +1,12 @@
 #include "Pictures.h"
 
+#include <sys/statvfs.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdlib>
+#include <cstring>
 #include <filesystem>
 #include <system_error>
 
@@ -11,181 +18,274 @@ namespace {
 using namespace std::chrono_literals;
 
 constexpr auto kBriefly = 5s;
+constexpr auto kEndGrace = 5s;
+// Who was stopped, or held up, for longer than this has seen nothing of what came meanwhile.
+constexpr auto kPause = 1s;
+constexpr auto kDiskStep = 1s;
+// With less room than this no picture can be received.
+constexpr std::uint64_t kLittleRoom = std::uint64_t{1} << 20;
 
-std::string withCount(std::size_t count, const std::string& noun) {
-  return std::to_string(count) + " " + noun + (count == 1 ? "" : "s");
+// Where a relative path leads may change; what is said of it must not.
+std::string preparedFolder(const std::string& given) {
+  std::error_code error;
+  std::filesystem::create_directories(given, error);
+  if (!platform::FileManager::isDirectory(given)) {
+    throw Failure{kUsage, "cannot make the folder " + given + (error ? ": " + error.message() : "")};
+  }
+  std::string folder = std::filesystem::absolute(given, error).lexically_normal();
+  if (error) folder = given;
+  while (folder.size() > 1 && folder.back() == '/') folder.pop_back();
+  std::string tried = platform::appendingPathComponent(folder, ".tether.XXXXXX");
+  const Descriptor file(mkstemp(tried.data()));
+  if (!file) throw Failure{kUsage, "cannot write in the folder " + folder + ": " + std::strerror(errno)};
+  unlink(tried.c_str());
+  return folder;
+}
+
+// Written for every object that is deleted.
+bool isNoise(const std::string& line) {
+  return line.find(" - ACQLOCK - for deleting CNikonObject") != std::string::npos;
 }
 
 }  // namespace
 
-Pictures::Pictures(const std::string& folder, Console& console) : _console(console), _mover(folder) {
-  std::error_code error;
-  std::filesystem::create_directories(folder, error);
-  if (!platform::FileManager::isDirectory(folder)) {
-    throw Failure{kNotSaved, "cannot make the folder " + folder + (error ? ": " + error.message() : "")};
+Pictures::Pictures(const Options& options, Console& console, Link& link, const std::shared_ptr<Wakeup>& wakeup,
+                   bool sendsShutters)
+    : _options(options),
+      _console(console),
+      _link(link),
+      _sendsShutters(sendsShutters),
+      _folder(preparedFolder(options.output)),
+      _saver(_folder, wakeup),
+      _report(console, _folder, sendsShutters),
+      _shots(link.timeout()) {
+  _saver.collectLeftovers();
+}
+
+// The course.
+
+std::optional<Event> Pictures::next(Clock::time_point until) {
+  notePause(_handled);
+  probe();
+  until = std::min(until, _shots.nextCheck(Clock::now()));
+  if (_link.canProbe()) until = std::min(until, _shots.nextProbe());
+  auto event = _link.next(until);
+  if (!event) notePause(until);
+  if (event) take(*event);
+  takeSaved();
+  takeLeftovers();
+  // What came is looked at before anything is held to be missing.
+  if (!event) _shots.check(Clock::now());
+  tellNotices();
+  if (!event && _saving.empty()) _link.tidy(_left);
+  _handled = Clock::now();
+  return event;
+}
+
+void Pictures::notePause(Clock::time_point expected) {
+  const auto late = Clock::now() - expected;
+  if (late > kPause) _shots.delayed(late);
+}
+
+void Pictures::probe() {
+  if (!_link.canProbe() || Clock::now() < _shots.nextProbe()) return;
+  if (const auto id = _link.probe()) _shots.probeSent(*id, Clock::now());
+}
+
+void Pictures::take(const Event& event) {
+  const auto now = Clock::now();
+  if (const auto* const added = std::get_if<ObjectWasAdded>(&event)) {
+    const Picture& picture = _shots.announced(*added, _link.onlyCamera(), now);
+    tellNotices();  // of the one before
+    _report.receiving(picture);
+  } else if (const auto* const complete = std::get_if<FileDownloadComplete>(&event)) {
+    save(_shots.completed(*complete, _link.onlyCamera(), now), complete->file_path);
+  } else if (const auto* const other = std::get_if<OtherMessage>(&event)) {
+    _shots.answered(other->id, now);
+  } else if (std::holds_alternative<Heartbeat>(event)) {
+    _shots.heartbeat(now);
+  } else if (const auto* const removed = std::get_if<DeviceRemoved>(&event)) {
+    unplugged(*removed);
+  } else if (const auto* const line = std::get_if<LogLine>(&event)) {
+    takeLog(line->text);
+  }
+  tellNotices();
+}
+
+void Pictures::connected() { _shots.connected(std::max(Clock::now(), _link.firstPassBy())); }
+
+bool Pictures::releaseShutter() {
+  _link.throwIfStopped();
+  const auto before = _link.probe();
+  if (before) _shots.probeSent(*before, Clock::now());
+  _link.session().send("doCapture");
+  if (_link.session().lost()) return false;
+  _report.shutter(_shots.shutterSent(before, Clock::now()));
+  if (const auto behind = _link.probe()) _shots.probeSent(*behind, Clock::now());
+  return true;
+}
+
+void Pictures::unplugged(const DeviceRemoved& removed) {
+  const Camera& camera = _link.lastRemoved();
+  const bool ours = _link.isChosen(camera);
+  if (ours || !_sendsShutters) {
+    const std::string text = camera.name + " (" + std::to_string(removed.device_id) + ") has gone";
+    _report.camera("camera_removed", camera, _sendsShutters ? "" : text);
+  }
+  const Picture* const picture = _shots.receiving();
+  if (picture != nullptr && (ours || !_sendsShutters)) {
+    _console.say(camera.name + " was unplugged while " + picture->name + " was being received");
+  }
+  if (ours || _link.onlyCamera()) _shots.unplugged(camera.name + " was unplugged", Clock::now());
+}
+
+void Pictures::restart(const HelperLost& lost) {
+  _link.end(0s, [this](const Event& event) { take(event); });
+  _report.helperLost(lost.description);
+  _shots.giveUp(lost.description, Clock::now());
+  tellNotices();
+  _link.restart(lost);
+}
+
+// Files.
+
+void Pictures::save(const Picture& picture, const std::string& source) {
+  FileSaver::Job job;
+  job.ticket = static_cast<std::uint64_t>(picture.number);
+  job.directory = _link.session().directory();
+  job.source = source;
+  job.name = picture.name;
+  if (picture.size >= 0) job.size = picture.size;
+  job.pair = static_cast<std::uint64_t>(picture.pair);
+  _saving[picture.number] = picture;
+  _saver.submit(std::move(job));
+}
+
+void Pictures::takeSaved() {
+  while (const auto saved = _saver.next()) {
+    const auto number = static_cast<int>(saved->ticket);
+    const Picture picture = _saving.at(number);
+    _saving.erase(number);
+    _shots.ended(number, saved->file.moved);
+    if (saved->file.moved) {
+      _report.saved(picture, saved->file);
+    } else {
+      _report.notSaved(picture, saved->file);
+      _left.insert(saved->file.path);
+    }
   }
 }
 
-void Pictures::take(const Event& event, const std::optional<Camera>& camera) {
-  if (const auto* const added = std::get_if<ObjectWasAdded>(&event)) announced(*added, camera);
-  if (const auto* const complete = std::get_if<FileDownloadComplete>(&event)) completed(*complete, camera);
-}
-
-void Pictures::shutterReleased() { _shutters.push_back(Clock::now()); }
-
-Clock::time_point Pictures::takeShutterTime() {
-  if (_shutters.empty()) return Clock::now();
-  const auto time = _shutters.front();
-  _shutters.pop_front();
-  return time;
-}
-
-void Pictures::announced(const ObjectWasAdded& object, const std::optional<Camera>& camera) {
-  _lastProgress = Clock::now();
-  Picture picture{object, camera, nullptr, _lastProgress, _lastProgress};
-  pairUp(picture);
-  _underWay[object.capture_id] = std::move(picture);
-}
-
-// Finds the picture's place in a pair, and the time from which it counts.
-void Pictures::pairUp(Picture& picture) {
-  const std::string_view name = platform::lastPathComponent(picture.object.file_name);
-  const std::string_view base = platform::deletingPathExtension(name);
-  const std::string_view extension = platform::pathExtension(name);
-  const bool second = picture.object.has_sidecar && _openPair && _openPair->announced == base &&
-                      _openPair->extension != extension && _openPair->files == 1;
-  if (second) {
-    _openPair->files = 2;
-    picture.pair = _openPair;
-    picture.since = _openPair->since;
-    return;
+// What a tether left that was killed.
+void Pictures::takeLeftovers() {
+  while (const auto leftover = _saver.nextLeftover()) {
+    const MovedFile& file = leftover->file;
+    const bool saved = leftover->fate == Leftover::Fate::kSaved;
+    const bool removed = leftover->fate == Leftover::Fate::kRemoved;
+    const char* const fate = saved ? "saved" : removed ? "removed" : "left";
+    Report::leftover(_console, fate, leftover->found, saved ? file.path : leftover->found, file.description);
+    const std::string why = file.description.empty() ? "" : " (" + file.description + ")";
+    if (saved) {
+      _console.say("found " + leftover->found + ", left by a tether that was killed: saved as " + file.path + why);
+    } else {
+      _console.say((removed ? "removed " : "left where it is: ") + leftover->found + ", of a tether that was killed" +
+                   why);
+    }
   }
-  closePair();
-  picture.since = takeShutterTime();
-  if (!picture.object.has_sidecar) return;
-  _openPair = std::make_shared<Pair>();
-  _openPair->announced = base;
-  _openPair->extension = extension;
-  _openPair->since = picture.since;
-  picture.pair = _openPair;
 }
 
-// Whatever the pair has, nothing more belongs to it.
-void Pictures::closePair() {
-  const auto pair = std::exchange(_openPair, nullptr);
-  if (!pair || pair->closed) return;
-  pair->closed = true;
-  if (pair->files == 1) _console.say("the other file of " + pair->announced + "." + pair->extension + " did not come");
-  if (pair->finished == pair->files) ++_done;
+// Causes.
+
+void Pictures::takeLog(const std::string& line) {
+  if (isNoise(line)) return;
+  _report.helperLog(line, _options.helperLog == "-");
+  if (_shots.remark(line)) return;
+  // Of a picture that nobody waits for nothing else will tell.
+  const std::string trouble = troubleInDirectory();
+  if (trouble.empty()) return;
+  _shots.neverCame();
+  _report.neverCame(line + "; " + trouble);
 }
 
-void Pictures::completed(const FileDownloadComplete& complete, const std::optional<Camera>& camera) {
-  _lastProgress = Clock::now();
-  Picture picture;
-  const auto found = _underWay.find(complete.capture_id);
-  if (found != _underWay.end()) {
-    picture = std::move(found->second);
-    _underWay.erase(found);
-  } else {
-    picture.object.capture_id = complete.capture_id;
-    picture.object.file_name = complete.file_path;
-    picture.camera = camera;
-    picture.since = takeShutterTime();
-    picture.announced = _lastProgress;
+void Pictures::tellNotices() {
+  for (const Notice& notice : _shots.takeNotices()) {
+    std::string cause;
+    if (!notice.explained) {
+      const std::string trouble = troubleInDirectory();
+      cause = notice.remark.empty() ? "" : "the helper says: " + notice.remark;
+      cause += (cause.empty() || trouble.empty() ? "" : "; ") + trouble;
+    }
+    _report.notice(notice, cause);
   }
-  const bool first = picture.pair && !picture.pair->base;
-  const MovedFile moved = _mover.move(complete.file_path, picture.object.file_name, first,
-                                      picture.pair ? picture.pair->base : std::nullopt);
-  if (moved.moved && first) picture.pair->base = moved.base;
-  // A slow copy is no silence of the camera: what came meanwhile has not been looked at.
-  _lastProgress = Clock::now();
-  report(picture, moved);
-  finish(picture);
 }
 
-void Pictures::finish(const Picture& picture) {
-  if (!picture.pair) {
-    ++_done;
-    return;
-  }
-  Pair& pair = *picture.pair;
-  ++pair.finished;
-  if (pair.closed ? pair.finished != pair.files : pair.finished != 2) return;
-  ++_done;
-  pair.closed = true;
-  if (_openPair == picture.pair) _openPair.reset();
+std::string Pictures::troubleInDirectory() const {
+  const std::string& path = _link.directory();
+  if (path.empty()) return {};
+  if (!platform::FileManager::isDirectory(path)) return "its temporary folder " + path + " is gone";
+  struct statvfs status {};
+  if (statvfs(path.c_str(), &status) != 0) return {};
+  const std::uint64_t room = std::uint64_t{status.f_bavail} * status.f_frsize;
+  if (room >= kLittleRoom) return {};
+  return "there is no room in its temporary folder " + path + " (" + sizeText(static_cast<std::int64_t>(room)) + ")";
 }
 
-void Pictures::report(const Picture& picture, const MovedFile& moved) {
-  const std::chrono::duration<double> time = Clock::now() - picture.since;
-  const std::string name(platform::lastPathComponent(moved.path));
-  Json object = {{"event", moved.moved ? "saved" : "not_saved"},
-                 {"capture_id", picture.object.capture_id},
-                 {"name", name},
-                 {"path", moved.path},
-                 {"size", moved.size},
-                 {"seconds", time.count()},
-                 {"pair", picture.pair != nullptr}};
-  if (picture.camera) {
-    object["device_id"] = picture.camera->id;
-    object["camera"] = picture.camera->name;
-  }
-  if (!moved.description.empty()) object["description"] = moved.description;
-  if (!moved.moved) {
-    ++_notSaved;
-    _console.result("", object);
-    _console.say("could not save " + picture.object.file_name + " in " + _mover.folder() + ": " + moved.description +
-                 "; it stays at " + moved.path);
-    return;
-  }
-  const std::string camera = picture.camera ? "  " + picture.camera->name : "";
-  _console.result(name + "  " + sizeText(moved.size) + "  " + secondsText(time) + camera, object);
-  if (!moved.description.empty()) _console.say(moved.description);
-}
+// The end.
 
-void Pictures::giveUp(const std::string& reason) {
-  for (const auto& [id, picture] : _underWay) {
-    _console.result("", {{"event", "not_received"}, {"capture_id", id}, {"name", picture.object.file_name}});
-    _console.say(picture.object.file_name + " was not received: " + reason);
-  }
-  _underWay.clear();
-  _openPair.reset();
-  _shutters.clear();
-}
+bool Pictures::isSettled() const { return _shots.expected() == 0 && _saving.empty() && _shots.isCalm(Clock::now()); }
 
 std::string Pictures::status() const {
-  if (_underWay.empty()) return {};
-  const Picture& picture = _underWay.begin()->second;
-  return picture.object.file_name + " " + sizeText(picture.object.file_size) + " receiving " +
-         secondsText(Clock::now() - picture.announced);
+  const Picture* const picture = _shots.receiving();
+  if (picture == nullptr) return {};
+  return picture->name + " " + sizeText(picture->size) + " receiving " + secondsText(Clock::now() - picture->announced);
 }
 
-// What the camera still owes, announced or not: released shutters, and the other file of a pair.
-std::size_t Pictures::expected() const {
-  return _underWay.size() + _shutters.size() + (_openPair && _openPair->files == 1 ? 1 : 0);
+int Pictures::finish(const Failure& failure) {
+  _link.finishing();
+  if (failure.status == kInterrupted || failure.status == kUnwritable) waitBriefly();
+  _link.finishing();
+  _link.end(kEndGrace, [this](const Event& event) { take(event); });
+  _shots.giveUp(failure.status == kInterrupted ? "interrupted" : "the helper has ended", Clock::now());
+  tellNotices();
+  waitForDisk();
+  _link.tidy(_left);
+  const Shots::Counts& counts = _shots.counts();
+  if (counts.own.notSaved + counts.others.notSaved > 0) return kNotSaved;
+  if (failure.status == kHelperLost || failure.status == kNoCamera) return failure.status;
+  return counts.own.missing + counts.others.missing > 0 ? kTimeout : failure.status;
 }
 
-// Until nothing is expected, or nothing more comes in time.
-void Pictures::takeUntil(Clock::time_point until, Link& link) {
-  while (const auto event = link.next(until)) {
-    if (std::holds_alternative<HelperLost>(*event)) return;
-    take(*event, std::nullopt);
-    if (expected() == 0 && Clock::now() < until) return;
+// Until nothing is awaited, or nothing more comes in time; a second Ctrl-C ends it.
+void Pictures::waitBriefly() {
+  const auto isOver = [](const std::optional<Event>& event) {
+    return event && std::holds_alternative<HelperLost>(*event);
+  };
+  try {
+    // What has been announced by now counts as under way, what has come does not.
+    for (auto event = next(Clock::now()); event; event = next(Clock::now())) {
+      if (isOver(event)) return;
+    }
+    if (_shots.expected() == 0) return;
+    _console.say("waiting up to 5 seconds for " + countText(_shots.expected(), "picture") +
+                 " under way; Ctrl-C again to leave");
+    const auto until = Clock::now() + kBriefly;
+    while (_shots.expected() > 0 && Clock::now() < until && !isOver(next(until))) {
+    }
+  } catch (const Failure&) {
+    // Asked again: no more waiting.
   }
 }
 
-void Pictures::waitBriefly(Link& link) {
-  link.finishing();
-  try {
-    // What has been announced by now counts as under way.
-    takeUntil(Clock::now(), link);
-    if (expected() == 0) return;
-    _console.say("waiting up to 5 seconds for " + withCount(expected(), "picture") +
-                 " under way; Ctrl-C again to leave");
-    takeUntil(Clock::now() + kBriefly, link);
-  } catch (const Failure&) {
-    // Asked again: no more waiting.
-    link.finishing();
+// However long it takes: what is not saved yet is whole, and in nobody's way where it is. A third Ctrl-C ends the
+// process.
+void Pictures::waitForDisk() {
+  bool said = false;
+  for (;;) {
+    const bool done = _saver.waitUntil(Clock::now() + kDiskStep);
+    takeSaved();
+    takeLeftovers();
+    if (done) return;
+    if (!std::exchange(said, true)) _console.say("waiting for the disk");
   }
 }
 

@@ -1,82 +1,75 @@
-// The pictures under way, from their announcement to their place in the output folder.
+// The pictures of a run on their way from the helper into the output folder: what `capture` and `watch` have in common.
+// Takes every event, keeps the ledger, has files saved, and says what has become of each.
 #pragma once
 
-#include <deque>
 #include <map>
 #include <memory>
 #include <optional>
+#include <set>
 #include <string>
+#include <utility>
 
-#include "Console.h"
-#include "FileMover.h"
+#include "FileSaver.h"
 #include "Link.h"
+#include "Report.h"
+#include "Shots.h"
 
 namespace tether::command {
 
 class Pictures {
  public:
-  // Makes the folder where it is missing; throws Failure when that fails. The console outlives the pictures.
-  Pictures(const std::string& folder, Console& console);
+  // Makes the folder where it is missing; throws Failure when that fails, or when nothing can be written there. The
+  // console and the link outlive the pictures. `sendsShutters`: pictures of others are named as such.
+  Pictures(const Options& options, Console& console, Link& link, const std::shared_ptr<Wakeup>& wakeup,
+           bool sendsShutters);
 
-  // Deals with an announcement or a completion; leaves every other event alone. `camera`: where pictures come from,
-  // where that is known.
-  void take(const Event& event, const std::optional<Camera>& camera);
-  // The shutter was released: the next picture counts its time from here.
-  void shutterReleased();
-  // Pictures under way will not come any more, for the reason given.
-  void giveUp(const std::string& reason);
+  // The next event, after it was taken; nothing when none came in time. Probes, and says what the time tells. Throws
+  // Failure as Link::next().
+  std::optional<Event> next(Clock::time_point until);
+  void take(const Event& event);
+  // After the link connected a camera.
+  void connected();
+  // Fires the connected camera. False when the helper was lost before it could be told.
+  bool releaseShutter();
+  // After a HelperLost event: takes what the helper still said, and starts another. Throws Failure.
+  void restart(const HelperLost& lost);
 
-  // Announced and not complete.
-  std::size_t underWay() const { return _underWay.size(); }
-  // Pictures brought to an end, saved or not; a pair is one.
-  int done() const { return _done; }
-  int notSaved() const { return _notSaved; }
-  // When a picture was last announced or completed.
-  Clock::time_point lastProgress() const { return _lastProgress; }
+  // The end, once and whatever the reason: waits briefly for what is under way where the user asked for the end, ends
+  // the helper, waits for the disk, and says what is missing. Returns the worst that happened as an exit status, which
+  // is `failure`'s where pictures tell nothing worse.
+  int finish(const Failure& failure);
+
+  // Whether nothing is awaited any more, and everything that was shot until now has come.
+  bool isSettled() const;
+  const Shots& shots() const { return _shots; }
+  Report& report() { return _report; }
   // "Capture0001.jpg 12.3 MB receiving 1.2 s", or "".
   std::string status() const;
 
-  // Waits up to 5 seconds for what is under way, pictures whose shutter was released among it, after the user asked to
-  // end; a second Ctrl-C ends that too.
-  void waitBriefly(Link& link);
-
  private:
-  // The two files of one shot.
-  struct Pair {
-    std::string announced;  // base name
-    std::string extension;  // of the first
-    std::optional<std::string> base;
-    int files = 1;
-    int finished = 0;
-    bool closed = false;
-    Clock::time_point since;
-  };
-  struct Picture {
-    ObjectWasAdded object;
-    std::optional<Camera> camera;
-    std::shared_ptr<Pair> pair;
-    Clock::time_point since;
-    Clock::time_point announced;
-  };
+  void probe();
+  void notePause(Clock::time_point expected);
+  void save(const Picture& picture, const std::string& source);
+  void takeSaved();
+  void takeLeftovers();
+  void takeLog(const std::string& line);
+  void tellNotices();
+  void unplugged(const DeviceRemoved& removed);
+  std::string troubleInDirectory() const;
+  void waitBriefly();
+  void waitForDisk();
 
-  void announced(const ObjectWasAdded& object, const std::optional<Camera>& camera);
-  void completed(const FileDownloadComplete& complete, const std::optional<Camera>& camera);
-  void pairUp(Picture& picture);
-  void finish(const Picture& picture);
-  void closePair();
-  Clock::time_point takeShutterTime();
-  std::size_t expected() const;
-  void takeUntil(Clock::time_point until, Link& link);
-  void report(const Picture& picture, const MovedFile& moved);
-
+  const Options& _options;
   Console& _console;
-  FileMover _mover;
-  std::map<std::int32_t, Picture> _underWay;
-  std::shared_ptr<Pair> _openPair;
-  std::deque<Clock::time_point> _shutters;
-  Clock::time_point _lastProgress = Clock::now();
-  int _done = 0;
-  int _notSaved = 0;
+  Link& _link;
+  const bool _sendsShutters;
+  const std::string _folder;
+  FileSaver _saver;
+  Report _report;
+  Shots _shots;
+  std::map<int, Picture> _saving;
+  std::set<std::string> _left;  // paths of what could not be saved
+  Clock::time_point _handled = Clock::now();
 };
 
 }  // namespace tether::command

@@ -8,7 +8,7 @@ constexpr std::size_t kNameWidth = 16;
 
 }  // namespace
 
-int runSettings(const Options& options, Console& console, const std::shared_ptr<Wakeup>& wakeup) {
+Outcome runSettings(const Options& options, Console& console, const std::shared_ptr<Wakeup>& wakeup) {
   Link link(options, console, wakeup);
   link.start();
   const Camera camera = link.choose([](const Event&) {});
@@ -17,18 +17,17 @@ int runSettings(const Options& options, Console& console, const std::shared_ptr<
   if (reply.kind != Reply::Kind::kOk) link.fail(reply, "reading the settings of " + camera.name);
 
   const Settings settings = settingsFrom(*reply.payload);
-  Json object = {{"device_id", camera.id}, {"camera", camera.name}};
+  Json object = eventJson("settings");
+  object["device_id"] = camera.id;
+  object["camera"] = camera.name;
   for (std::size_t i = 0; i < settings.size(); ++i) object[kSettingNames[i]] = settingJson(settings[i]);
-  if (console.json()) {
-    console.result("", object);
-    return console.closed() ? kUnwritable : kSuccess;
-  }
-  for (std::size_t i = 0; i < settings.size(); ++i) {
+  if (console.json()) console.result("", object);
+  for (std::size_t i = 0; i < settings.size() && !console.json(); ++i) {
     std::string name = kSettingNames[i];
     name.resize(kNameWidth, ' ');
     console.result(name + settingText(settings[i]), object);
   }
-  return console.closed() ? kUnwritable : kSuccess;
+  return {console.closed() ? kUnwritable : kSuccess, "", {}};
 }
 
 }  // namespace tether::command

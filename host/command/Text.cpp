@@ -1,8 +1,11 @@
 #include "Text.h"
 
 #include <array>
+#include <cctype>
 #include <cmath>
 #include <cstdio>
+#include <cstring>
+#include <ctime>
 
 namespace tether::command {
 namespace {
@@ -13,11 +16,11 @@ std::string rounded(double number, int decimals) {
   return text.data();
 }
 
-std::string hexadecimal(const KtLuaTEData& data) {
+std::string hexadecimal(const void* bytes, std::size_t count) {
   static const char* const kDigits = "0123456789abcdef";
   std::string text;
-  for (std::int32_t i = 0; i < data.getLength(); ++i) {
-    const auto byte = static_cast<const unsigned char*>(data.getBytes())[i];
+  for (std::size_t i = 0; i < count; ++i) {
+    const auto byte = static_cast<const unsigned char*>(bytes)[i];
     text += kDigits[byte >> 4U];
     text += kDigits[byte & 15U];
   }
@@ -27,6 +30,37 @@ std::string hexadecimal(const KtLuaTEData& data) {
 bool isPlainInteger(double number) {
   constexpr double kLargestPlain = 1e15;
   return std::abs(number) < kLargestPlain && number == std::floor(number);
+}
+
+bool isUtf8(const std::string& text) {
+  try {
+    static_cast<void>(Json(text).dump());
+    return true;
+  } catch (const Json::exception&) {
+    return false;
+  }
+}
+
+std::string percentEncoded(const std::string& text) {
+  std::string encoded;
+  for (const char character : text) {
+    const bool plain =
+        std::strchr("-._~/", character) != nullptr || std::isalnum(static_cast<unsigned char>(character));
+    encoded += plain ? std::string(1, character) : "%" + hexadecimal(&character, 1);
+  }
+  return encoded;
+}
+
+// In UTC, to the millisecond: 2026-01-31T23:59:59.123Z.
+std::string timeText(std::chrono::system_clock::time_point time) {
+  const auto sinceEpoch = std::chrono::floor<std::chrono::milliseconds>(time.time_since_epoch());
+  const auto seconds = static_cast<std::time_t>(sinceEpoch.count() / 1000);
+  std::tm parts{};
+  gmtime_r(&seconds, &parts);
+  std::array<char, 64> text{};
+  const std::size_t length = std::strftime(text.data(), text.size(), "%Y-%m-%dT%H:%M:%S", &parts);
+  std::snprintf(text.data() + length, text.size() - length, ".%03dZ", static_cast<int>(sinceEpoch.count() % 1000));
+  return text.data();
 }
 
 Json numberJson(double number) {
@@ -68,7 +102,9 @@ Json settingJson(const SettingValue& value) {
 Json payloadJson(KtLuaTE& payload) {
   if (payload.getType() == kKtLuaTypeNumber) return numberJson(static_cast<double>(payload));
   if (payload.getType() == kKtLuaTypeString) return static_cast<std::string>(payload);
-  if (const auto* const data = dynamic_cast<const KtLuaTEData*>(&payload)) return {{"data", hexadecimal(*data)}};
+  if (const auto* const data = dynamic_cast<const KtLuaTEData*>(&payload)) {
+    return {{"data", hexadecimal(data->getBytes(), static_cast<std::size_t>(data->getLength()))}};
+  }
   const auto* const table = dynamic_cast<const KtLuaTETable*>(&payload);
   if (table == nullptr) return nullptr;
   Json object = Json::object();
@@ -77,6 +113,17 @@ Json payloadJson(KtLuaTE& payload) {
     object[name.is_string() ? name.get<std::string>() : name.dump()] = payloadJson(*value);
   }
   return object;
+}
+
+Json eventJson(const char* name) { return {{"event", name}, {"time", timeText(std::chrono::system_clock::now())}}; }
+
+void addPath(Json& object, const std::string& key, const std::string& path) {
+  object[key] = path;
+  if (!isUtf8(path)) object[key + "_bytes"] = percentEncoded(path);
+}
+
+std::string countText(std::size_t count, const std::string& noun) {
+  return std::to_string(count) + " " + noun + (count == 1 ? "" : "s");
 }
 
 std::string printable(std::string text) {

@@ -22,6 +22,15 @@ Json settingJson(const SettingValue& value);
 // A payload as JSON. Keys that are no strings are written as text; data becomes {"data": hexadecimal}.
 Json payloadJson(KtLuaTE& payload);
 
+// An object of one event, with the present time.
+Json eventJson(const char* name);
+// Adds a path to an object. One that is not UTF-8 is exact under the key with "_bytes" behind it only: every byte but
+// letters, digits and -._~/ as % and two hexadecimal digits.
+void addPath(Json& object, const std::string& key, const std::string& path);
+
+// "1 picture", "2 pictures".
+std::string countText(std::size_t count, const std::string& noun);
+
 // Text from outside, safe to print in one line on a terminal: control characters become "?".
 std::string printable(std::string text);
 

@@ -1,8 +1,8 @@
 #include <algorithm>
+#include <map>
 #include <set>
 
 #include "Commands.h"
-#include "Link.h"
 #include "Pictures.h"
 
 namespace tether::command {
@@ -10,7 +10,6 @@ namespace {
 
 using namespace std::chrono_literals;
 
-constexpr auto kEndGrace = 5s;
 constexpr auto kStatusStep = 200ms;
 // A camera that would not connect is asked again after this.
 constexpr auto kConnectAgain = 5s;
@@ -20,60 +19,67 @@ constexpr auto kFirstCameraPatience = 3s;
 class Watch {
  public:
   Watch(const Options& options, Console& console, const std::shared_ptr<Wakeup>& wakeup)
-      : _options(options), _console(console), _pictures(options.output, console), _link(options, console, wakeup) {}
+      : _options(options),
+        _console(console),
+        _link(options, console, wakeup),
+        _pictures(options, console, _link, wakeup, false) {}
 
-  int run() {
+  Outcome run() {
+    Failure end{kSuccess, ""};
     try {
       _link.start();
       while (!isDone()) step();
     } catch (const Failure& failure) {
-      finish(failure.status);
-      throw;
+      end = failure;
     }
-    finish(kSuccess);
-    if (_pictures.notSaved() > 0) return kNotSaved;
-    if (_stuck) return kTimeout;
-    return _console.closed() ? kUnwritable : kSuccess;
+    Outcome outcome;
+    outcome.status = _pictures.finish(end);
+    outcome.error = end.text;
+    const Shots::Counts& counts = _pictures.shots().counts();
+    if (counts.others.missing > 0) {
+      outcome.error += (end.text.empty() ? "" : "; ") +
+                       countText(static_cast<std::size_t>(counts.others.missing), "picture") + " did not come";
+    }
+    outcome.details = countsJson(counts);
+    if (outcome.status == kSuccess && _console.closed()) outcome.status = kUnwritable;
+    return outcome;
   }
 
  private:
-  bool isDone() const { return _options.count && _pictures.done() >= *_options.count; }
+  bool isDone() const {
+    const Shots::Tally& all = _pictures.shots().counts().others;
+    return _options.count && all.saved + all.notSaved >= *_options.count;
+  }
 
   void step() {
     connectOne();
     auto until = Clock::time_point::max();
-    if (!_waiting.empty()) until = _connectAgain;
-    const auto stuckAt = _pictures.lastProgress() + _link.timeout();
-    if (_pictures.underWay() > 0) until = std::min(until, stuckAt);
+    for (const auto& [id, time] : _toConnect) until = std::min(until, time);
     const auto patience = _link.startedAt() + kFirstCameraPatience;
     if (!_saidNoCamera) until = std::min(until, patience);
     if (_console.live()) {
       showStatus();
       until = std::min(until, Clock::now() + kStatusStep);
     }
-    if (const auto event = _link.next(until)) handle(*event);
-
-    if (_pictures.underWay() > 0 && Clock::now() >= _pictures.lastProgress() + _link.timeout()) {
-      _stuck = true;
-      _pictures.giveUp("nothing came for " + secondsText(_link.timeout()));
-    }
+    if (const auto event = _pictures.next(until)) handle(*event);
     if (!_saidNoCamera && Clock::now() >= patience) sayNoCamera();
   }
 
   void sayNoCamera() {
     _saidNoCamera = true;
-    if (_connected.empty() && _waiting.empty()) {
+    if (_connected.empty() && _toConnect.empty()) {
       _console.say(_options.camera.empty() ? "no camera yet; waiting for one"
                                            : "no camera " + _options.camera + " yet; waiting for it");
     }
   }
 
-  // Takes the first of the cameras that wait to be connected. The helper connects one at a time; a camera keeps sending
-  // its pictures when another is connected after it.
+  // Connects the camera whose turn it is. The helper connects one at a time; a camera keeps sending its pictures when
+  // another is connected after it.
   void connectOne() {
-    if (_waiting.empty() || Clock::now() < _connectAgain) return;
-    const std::int32_t id = *_waiting.begin();
-    const Camera camera{id, _link.cameras().at(id)};
+    const auto next = std::min_element(_toConnect.begin(), _toConnect.end(),
+                                       [](const auto& one, const auto& other) { return one.second < other.second; });
+    if (next == _toConnect.end() || Clock::now() < next->second) return;
+    const Camera camera{next->first, _link.cameras().at(next->first)};
     try {
       _link.connect(camera);
     } catch (const Failure& failure) {
@@ -82,48 +88,32 @@ class Watch {
         if (failure.status == kHelperLost) return;
         throw;
       }
-      _connectAgain = Clock::now() + kConnectAgain;
-      if (_refused.insert(id).second) _console.say(failure.text + "; trying again");
+      next->second = Clock::now() + kConnectAgain;
+      _pictures.report().connectFailed(camera, failure.text, !_refused.insert(camera.id).second);
       return;
     }
-    _waiting.erase(id);
-    _refused.erase(id);
-    _connected.insert(id);
-    _console.result(camera.name + " (" + std::to_string(id) + ") connected",
-                    {{"event", "connected"}, {"device_id", id}, {"name", camera.name}});
+    _toConnect.erase(next);
+    _refused.erase(camera.id);
+    _connected.insert(camera.id);
+    _pictures.connected();
+    _pictures.report().camera("connected", camera, camera.name + " (" + std::to_string(camera.id) + ") connected");
   }
 
   void handle(const Event& event) {
-    _pictures.take(event, onlyCamera());
     if (const auto* const added = std::get_if<DeviceAdded>(&event)) {
-      _console.result(_options.json ? "" : added->name + " (" + std::to_string(added->device_id) + ") is there",
-                      {{"event", "camera_added"}, {"device_id", added->device_id}, {"name", added->name}});
-      if (_link.isWanted({added->device_id, added->name})) _waiting.insert(added->device_id);
+      const Camera camera{added->device_id, added->name};
+      _pictures.report().camera("camera_added", camera, camera.name + " (" + std::to_string(camera.id) + ") is there");
+      if (_link.isWanted(camera)) _toConnect[camera.id] = Clock::now();
     } else if (const auto* const removed = std::get_if<DeviceRemoved>(&event)) {
-      _console.result("camera " + std::to_string(removed->device_id) + " has gone",
-                      {{"event", "camera_removed"}, {"device_id", removed->device_id}});
-      forget(removed->device_id);
+      _toConnect.erase(removed->device_id);
+      _connected.erase(removed->device_id);
+      _refused.erase(removed->device_id);
     } else if (const auto* const lost = std::get_if<HelperLost>(&event)) {
-      _pictures.giveUp(lost->description);
-      _waiting.clear();
+      _toConnect.clear();
       _connected.clear();
       _refused.clear();
-      _connectAgain = {};
-      _link.restart(*lost);
+      _pictures.restart(*lost);
     }
-  }
-
-  void forget(std::int32_t id) {
-    _waiting.erase(id);
-    _connected.erase(id);
-    _refused.erase(id);
-  }
-
-  // Announcements do not say which camera they are from: it is known only where there is one.
-  std::optional<Camera> onlyCamera() const {
-    const auto& cameras = _link.cameras();
-    if (cameras.size() != 1) return {};
-    return Camera{cameras.begin()->first, cameras.begin()->second};
   }
 
   void showStatus() {
@@ -132,28 +122,19 @@ class Watch {
     _console.status(text);
   }
 
-  void finish(int status) {
-    if (status == kInterrupted || status == kUnwritable) _pictures.waitBriefly(_link);
-    _link.finishing();
-    _link.end(kEndGrace, [this](const Event& event) { _pictures.take(event, std::nullopt); });
-    _pictures.giveUp("the helper has ended");
-  }
-
   const Options& _options;
   Console& _console;
-  Pictures _pictures;
   Link _link;
-  std::set<std::int32_t> _waiting;    // wanted, to be connected
-  std::set<std::int32_t> _connected;  // at least once since it came
-  std::set<std::int32_t> _refused;    // and the user has been told
-  Clock::time_point _connectAgain;
+  Pictures _pictures;
+  std::map<std::int32_t, Clock::time_point> _toConnect;  // wanted, and when to ask
+  std::set<std::int32_t> _connected;                     // at least once since it came
+  std::set<std::int32_t> _refused;                       // and the user has been told
   bool _saidNoCamera = false;
-  bool _stuck = false;
 };
 
 }  // namespace
 
-int runWatch(const Options& options, Console& console, const std::shared_ptr<Wakeup>& wakeup) {
+Outcome runWatch(const Options& options, Console& console, const std::shared_ptr<Wakeup>& wakeup) {
   return Watch(options, console, wakeup).run();
 }
 

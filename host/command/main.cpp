@@ -4,8 +4,10 @@
 
 #include <csignal>
 #include <exception>
+#include <iostream>
 #include <map>
 #include <string_view>
+#include <system_error>
 
 #include "CommandLine.h"
 #include "Commands.h"
@@ -60,35 +62,52 @@ void logOnlyWhatMatters(Console& console) {
   });
 }
 
-int run(const Parsed& parsed, Console& console, const std::shared_ptr<Wakeup>& wakeup) {
+Outcome run(Parsed& parsed, Console& console, const std::shared_ptr<Wakeup>& wakeup) {
   const std::map<std::string_view, decltype(&runList)> commands = {{"list", runList},
                                                                    {"settings", runSettings},
                                                                    {"capture", runCapture},
                                                                    {"watch", runWatch},
                                                                    {"messages", runMessages}};
   try {
+    // Where no pictures are asked for, nothing says where those go that come all the same.
+    if (parsed.subcommand != "capture" && parsed.subcommand != "watch") parsed.options.output.clear();
     return commands.at(parsed.subcommand)(parsed.options, console, wakeup);
   } catch (const Failure& failure) {
-    if (!failure.text.empty()) console.say(failure.text);
-    return failure.status;
+    return {failure.status, failure.text, {}};
   } catch (const std::exception& problem) {
-    console.say(problem.what());
-    return kHelperLost;
+    return {kHelperLost, problem.what(), {}};
   }
+}
+
+int tellOutcome(const Outcome& outcome, Console& console) {
+  Json object = eventJson("result");
+  object["status"] = outcome.status;
+  object["error"] = outcome.error.empty() ? Json() : Json(outcome.error);
+  if (outcome.details.is_object()) object.update(outcome.details);
+  if (!outcome.error.empty()) console.say(outcome.error);
+  console.result("", object);
+  return outcome.status;
 }
 
 }  // namespace
 
 int main(int argc, char** argv) {
   occupyClosedDescriptors();
-  const Parsed parsed = parseCommandLine(argc, argv);
+  Parsed parsed = parseCommandLine(argc, argv);
   if (parsed.subcommand.empty()) return parsed.status;
   // Never destroyed: a signal may come until the very end.
-  static const auto* const wakeup = new std::shared_ptr<Wakeup>(std::make_shared<Wakeup>());
+  static std::shared_ptr<Wakeup>* wakeup = nullptr;
+  try {
+    wakeup = new std::shared_ptr<Wakeup>(std::make_shared<Wakeup>());
+  } catch (const std::system_error& problem) {
+    std::cerr << "tether: cannot start: " << problem.what() << "\n";
+    return kHelperLost;
+  }
   watchSignals(**wakeup);
-  Console console(parsed.options.json);
+  Console console(parsed.options.json, **wakeup);
   logOnlyWhatMatters(console);
-  const int status = run(parsed, console, *wakeup);
+  const int status = tellOutcome(run(parsed, console, *wakeup), console);
   platform::setLogSink({});
-  return status;
+  // Output that was given up to come to an end is no fault of the output's.
+  return status == kUnwritable && (*wakeup)->everInterrupted() ? kInterrupted : status;
 }

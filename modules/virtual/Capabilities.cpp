@@ -32,7 +32,7 @@ void addOfCamera(std::vector<Capability>& list, const CameraState& camera) {
 void addOfData(std::vector<Capability>& list, const ItemState& item) {
   list.push_back(Capability::string(kNkMAIDCapability_Name, item.picture.name));
   list.push_back(Capability::unsignedInteger(kNkMAIDCapability_StoredBytes, shownSize(item.picture)));
-  list.push_back(Capability::unsignedInteger(kNkMAIDCapability_RawJpegImageStatus, item.pair ? 1 : 0));
+  list.push_back(Capability::unsignedInteger(kNkMAIDCapability_RawJpegImageStatus, item.pair != 0 ? 1 : 0));
   list.push_back(Capability::process(kNkMAIDCapability_Acquire));
 }
 

@@ -100,8 +100,9 @@ std::vector<Capability> defaultSettings() {
   return {
       Capability::unsigneds(kNkMAIDCapability_Sensitivity, {100, 200, 400, 800, 1600, 3200, 6400}, 2),
       Capability::integer(kNkMAIDCapability_BatteryLevel, 85),
-      Capability::unsignedInteger(kNkMAIDCapability_FreeBytes, 1'234'567'168),
-      Capability::integers(kNkMAIDCapability_ExposureMode, {0, 1, 2, 3}, 3),
+      Capability::unsignedInteger(kNkMAIDCapability_FreeBytes, 842),
+      Capability::packedStrings(kNkMAIDCapability_ExposureMode,
+                                {"Program", "Aperture priority", "Shutter priority", "Manual"}, 3),
       Capability::packedStrings(kNkMAIDCapability_Aperture, {"f/1.8", "f/2.8", "f/4", "f/5.6", "f/8", "f/11"}, 3),
       Capability::packedStrings(kNkMAIDCapability_ShutterSpeed, {"1/1000", "1/500", "1/250", "1/125", "1/60", "1"}, 3),
       Capability::strings(kNkMAIDCapability_WBMode, {"Auto", "Incandescent", "Fluorescent", "Direct sunlight"}, 0),

@@ -51,7 +51,7 @@ struct Capability {
   int32_t read(uint32_t dataType, void* data) const;
 };
 
-// The settings a camera has when a script says nothing else: one of every value type and element type in use.
+// The settings a camera has when a script says nothing else.
 std::vector<Capability> defaultSettings();
 
 }  // namespace virtualcamera

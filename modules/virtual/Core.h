@@ -37,7 +37,7 @@ struct Node {
 struct ItemState : Node {
   uint32_t id = 0;
   Picture picture;
-  bool pair = false;
+  uint32_t pair = 0;       // the first item's id, of both; 0 for none
   bool announced = false;  // AddChild has been delivered to the present opening of the camera
   Node data;
 };
@@ -120,7 +120,7 @@ class Core {
   void queueEvent(Node& node, uint32_t event, uint64_t data);
   std::vector<uint32_t> addItems(CameraState& camera, Shot shot);
   void removeItem(CameraState& camera, uint32_t id);
-  void removeCamera(uint32_t id);
+  std::vector<Shot> removeCamera(uint32_t id);
 
   mutable std::mutex mutex_;
   Options options_;
@@ -157,6 +157,7 @@ class Core {
   int32_t enumChildren(Lock&, const Object& object);
   void abandon(Object& object);
   void endUnplugged(Object& object);
+  static std::vector<Shot> shotsOn(const CameraState& camera);
   void waitForCallbacks(Lock&, const Object& object);
   void endAction(Action& action, int32_t result);
 
@@ -191,6 +192,7 @@ class Core {
   bool deliveryDue(const Object& object, Action& action) const;
   void deliverPiece(Lock&, const ObjectPtr& object, const std::shared_ptr<Action>& action);
   int32_t showPiece(Lock&, const ObjectPtr& object, const std::shared_ptr<Action>& action, tagNkMAIDFileInfo info);
+  static bool isSent(const Object& object);
   void finishDelivery(const ObjectPtr& object, Action& action, uint32_t length, int32_t result);
 
   std::condition_variable callbackEnded_;

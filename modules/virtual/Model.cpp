@@ -23,9 +23,9 @@ Camera& Model::addCamera(uint32_t id, const std::string& name) {
   return handle;
 }
 
-void Model::removeCamera(uint32_t id) {
+std::vector<Shot> Model::removeCamera(uint32_t id) {
   const Lock lock(core_->mutex_);
-  core_->removeCamera(id);
+  return core_->removeCamera(id);
 }
 
 Camera* Model::camera(uint32_t id) {

@@ -163,8 +163,8 @@ std::vector<uint32_t> Core::addItems(CameraState& camera, Shot shot) {
     auto item = std::make_shared<ItemState>();
     item->id = ++camera.lastItem;
     item->picture = std::move(picture);
-    item->pair = pair;
     ids.push_back(item->id);
+    item->pair = pair ? ids.front() : 0;
     camera.items.emplace(item->id, std::move(item));
     queueEvent(camera, kNkMAIDEvent_AddChild, ids.back());
   }
@@ -182,16 +182,30 @@ void Core::removeItem(CameraState& camera, uint32_t id) {
   if (!eraseQueued(camera, kNkMAIDEvent_AddChild, id)) queueEvent(camera, kNkMAIDEvent_RemoveChild, id);
 }
 
-void Core::removeCamera(uint32_t id) {
+std::vector<Shot> Core::removeCamera(uint32_t id) {
   const auto found = cameras_.find(id);
-  if (found == cameras_.end()) return;
+  if (found == cameras_.end()) return {};
   const std::shared_ptr<CameraState> camera = found->second.first;
   cameras_.erase(found);
+  for (const auto& [handle, object] : objects_)
+    if (object->camera == camera && isSent(*object)) camera->items.erase(object->item->id);
   camera->gone = true;
   camera->events.clear();
   for (auto& [handle, object] : objects_)
     if (object->camera == camera) endUnplugged(*object);
   if (!eraseQueued(module_, kNkMAIDEvent_AddChild, id)) queueEvent(module_, kNkMAIDEvent_RemoveChild, id);
+  return shotsOn(*camera);
+}
+
+std::vector<Shot> Core::shotsOn(const CameraState& camera) {
+  std::vector<Shot> shots;
+  uint32_t pair = 0;
+  for (const auto& [id, item] : camera.items) {
+    if (pair == 0 || item->pair != pair) shots.emplace_back();
+    shots.back().push_back(item->picture);
+    pair = item->pair;
+  }
+  return shots;
 }
 
 void Core::endUnplugged(Object& object) {

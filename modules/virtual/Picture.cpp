@@ -1,12 +1,13 @@
 #include "Picture.h"
 
 #include <fcntl.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <mutex>
 #include <utility>
+
+#include "FileState.h"
 
 namespace virtualcamera {
 namespace {
@@ -27,42 +28,54 @@ class MemorySource final : public PictureSource {
 
 class FileSource final : public PictureSource {
  public:
-  explicit FileSource(std::string path) : path_(std::move(path)) {
-    struct stat status {};
-    if (stat(path_.c_str(), &status) == 0) size_ = static_cast<uint64_t>(status.st_size);
-  }
-  ~FileSource() override {
-    if (descriptor_ >= 0) close(descriptor_);
-  }
+  explicit FileSource(std::string path) : path_(std::move(path)), state_(FileState::of(path_)) {}
+  ~FileSource() override { FileSource::rest(); }
   FileSource(const FileSource&) = delete;
   FileSource& operator=(const FileSource&) = delete;
 
-  uint64_t size() const override { return size_; }
+  uint64_t size() const override { return state_ ? static_cast<uint64_t>(state_->size) : 0; }
+  bool isThere() const override {
+    const std::optional<FileState> now = FileState::of(path_);
+    return now && state_ && now->looksLike(*state_);
+  }
+
+  void rest() const override {
+    const std::lock_guard lock(mutex_);
+    if (descriptor_ >= 0) close(descriptor_);
+    descriptor_ = -1;
+  }
 
   const uint8_t* piece(uint64_t offset, uint32_t length, std::vector<uint8_t>& scratch) const override {
-    const int descriptor = openOnce();
-    if (descriptor < 0) return nullptr;
+    const std::lock_guard lock(mutex_);
+    if (!openOnce()) return nullptr;
     if (scratch.size() <= length) scratch.resize(size_t{length} + 1);
     for (size_t done = 0; done < length;) {
-      const ssize_t got = pread(descriptor, scratch.data() + done, length - done, static_cast<off_t>(offset + done));
+      const ssize_t got = pread(descriptor_, scratch.data() + done, length - done, static_cast<off_t>(offset + done));
       if (got < 0 && errno == EINTR) continue;
       if (got <= 0) return nullptr;
       done += static_cast<size_t>(got);
     }
-    return scratch.data();
+    // Nobody is to get the beginning of one picture and the end of another.
+    const bool whole = offset + length < size() || FileState::of(descriptor_) == opened_;
+    return whole ? scratch.data() : nullptr;
   }
 
  private:
-  int openOnce() const {
-    const std::lock_guard lock(mutex_);
-    if (descriptor_ < 0) descriptor_ = open(path_.c_str(), O_RDONLY | O_CLOEXEC);
-    return descriptor_;
+  bool openOnce() const {
+    if (descriptor_ >= 0) return true;
+    descriptor_ = open(path_.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY);
+    opened_ = FileState::of(descriptor_);
+    if (opened_ && state_ && opened_->size == state_->size) return true;
+    if (descriptor_ >= 0) close(descriptor_);
+    descriptor_ = -1;
+    return false;
   }
 
   std::string path_;
-  uint64_t size_ = 0;
+  std::optional<FileState> state_;  // when the picture was made
   mutable std::mutex mutex_;
   mutable int descriptor_ = -1;
+  mutable std::optional<FileState> opened_{};
 };
 
 class PatternSource final : public PictureSource {

@@ -18,6 +18,11 @@ class PictureSource {
 
   virtual uint64_t size() const = 0;
 
+  // Whether its bytes are still what they were when it was made.
+  virtual bool isThere() const { return true; }
+  // Nothing more will be read for now: what is open for it need not stay so.
+  virtual void rest() const {}
+
   // The bytes from offset on, length of them, both within size(). The pointer is valid until the next call with the
   // same scratch, or until scratch or the source goes. Null: they could not be read.
   virtual const uint8_t* piece(uint64_t offset, uint32_t length, std::vector<uint8_t>& scratch) const = 0;
@@ -40,8 +45,8 @@ struct Picture {
   static Picture jpeg(std::vector<uint8_t> bytes) { return memory(kNkMAIDFileDataType_JPEG, std::move(bytes)); }
   static Picture raw(std::vector<uint8_t> bytes) { return memory(kNkMAIDFileDataType_NEF, std::move(bytes)); }
 
-  // A file, opened at its first delivery and read in delivery-sized pieces. Its size is taken now; bytes that are not
-  // there any more at the transfer end it with kNkMAIDResult_DataTransFailure.
+  // A file, opened at its first delivery and read in delivery-sized pieces. Its size is taken now. One that has another
+  // size then, is no regular file, or changes during the transfer ends it with kNkMAIDResult_DataTransFailure.
   static Picture file(uint32_t fileDataType, const std::string& path);
 
   // That many bytes of a pattern, stored nowhere: byte i is patternByte(i).

@@ -98,6 +98,16 @@ int32_t Core::showPiece(Lock& lock, const ObjectPtr& object, const std::shared_p
   return callBack(lock, object, [&] { return show(*object, *action, info, proc); });
 }
 
+// Also while the client is still being shown the last piece: it keeps it.
+bool Core::isSent(const Object& object) {
+  if (!object.action || object.action->capability != kNkMAIDCapability_Acquire) return false;
+  const Action& action = *object.action;
+  if (action.done) return action.result == kNkMAIDResult_NoError;
+  const bool showing = action.busy && !object.callbacks.empty();
+  const bool fails = action.fault.completionResult.value_or(kNkMAIDResult_NoError) != kNkMAIDResult_NoError;
+  return showing && !fails && action.offset + nextLength(object, action) >= sizeOf(object.item->picture);
+}
+
 void Core::finishDelivery(const ObjectPtr& object, Action& action, uint32_t length, int32_t result) {
   action.busy = false;
   action.offset += length;

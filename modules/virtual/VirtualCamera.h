@@ -10,7 +10,8 @@
 // A poll handles what was there when it began: what one poll brings about comes in the next.
 //
 // Pictures stay on the camera until a transfer of them has completed without error or a script removes them. A camera
-// that is opened again announces the pictures still on it again.
+// announces every picture on it once each time it is opened: what lies on its card and is not to be announced is not
+// among them.
 //
 // Everything here may be called from any thread, also from inside callbacks and hooks, unless said otherwise. One lock
 // per model, held neither while a callback runs nor while a hook or a picture's source does.
@@ -150,8 +151,9 @@ class Model {
   // Plugs a camera in, with default settings; an open module raises AddChild. A camera of that id is removed first.
   Camera& addCamera(uint32_t id, const std::string& name);
   // Unplugs it: not listed any more, RemoveChild, its objects answer ZombieObject (and IsAlive false). Of a transfer
-  // under way no further delivery starts; see Options::unplugResult. Unknown ids are ignored.
-  void removeCamera(uint32_t id);
+  // under way no further delivery starts; see Options::unplugResult. Unknown ids are ignored. Answers the shots on the
+  // camera of which a client has not got every byte.
+  std::vector<Shot> removeCamera(uint32_t id);
   Camera* camera(uint32_t id);  // null when there is none; valid like addCamera's
   std::vector<uint32_t> cameras() const;
 

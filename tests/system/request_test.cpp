@@ -28,7 +28,7 @@ void expectSettings(const Message& message) {
   EXPECT_EQ(message.number("isoSpeed"), 400);
   EXPECT_EQ(message.number("batteryLevel"), 85);
   EXPECT_TRUE(message.isNil("availableShots"));
-  EXPECT_EQ(message.number("aeMode"), 3);
+  EXPECT_EQ(message.text("aeMode"), "Manual");
   EXPECT_EQ(message.text("aperture"), "f/5.6");
   EXPECT_EQ(message.text("shutter"), "1/125");
   EXPECT_EQ(message.text("whiteBalance"), "Auto");

@@ -12,6 +12,8 @@ namespace {
 
 using Json = nlohmann::json;
 
+constexpr int kDeepest = 16;  // twice what anything here needs
+
 [[noreturn]] void fail(const std::string& message) { throw std::runtime_error(message); }
 
 // Numbers within a type's range; JSON's own conversion would cut them.
@@ -326,7 +328,10 @@ Fault readFault(const Json& json, uint32_t camera) {
 }  // namespace
 
 CameraFile parseCameraFile(const std::string& text, uint32_t camera) {
-  const Json json = Json::parse(text);
+  const Json json = Json::parse(text, [](int depth, Json::parse_event_t, const Json&) {
+    if (depth > kDeepest) fail("nested deeper than " + std::to_string(kDeepest) + " levels");
+    return true;
+  });
   CameraFile file;
   Reader reader(json, "camera.json");
   if (const Json* name = reader.find("name")) file.name = name->get<std::string>();

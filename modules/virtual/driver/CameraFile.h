@@ -1,4 +1,5 @@
-// camera.json: what a camera's folder says about the camera. All of it is optional; an unknown key is an error.
+// camera.json: what a camera's folder says about the camera. All of it is optional; an unknown key is an error, as
+// is a file above 1 MiB.
 //
 // {
 //   "name": "Studio",                     instead of the folder's; read when the camera is plugged in
@@ -9,10 +10,12 @@
 //   "capture": {"polls": 1, "completeEvent": true, "answer": "Pending"},
 //   "fileTypes": {".xyz": 99},            further extensions taken as pictures, and their file data types
 //   "settings": {                         by capability, a name or a number such as "0x8113"
-//     "BatteryLevel": 50,                 a new value for a setting that is there; of an enumeration, the entry to
-//     select "Aperture": "f/8", "FreeBytes": null,                  not announced "WBMode": {"type": "strings",
-//     "values": ["Auto", "Shade"], "current": 1}, "0x9001": {"type": "integer", "value": -3}, "0x9002": {"type": 4}
-//     announced with this value type, never readable
+//     "BatteryLevel": 50,                 a new value for a setting that is there
+//     "Aperture": "f/8",                  of an enumeration, the entry to select
+//     "FreeBytes": null,                  not announced
+//     "WBMode": {"type": "strings", "values": ["Auto", "Shade"], "current": 1},
+//     "0x9001": {"type": "integer", "value": -3},
+//     "0x9002": {"type": 4}               announced with this value type, never readable
 //   },                                    types: boolean, integer, unsigned, string; enumerations: integers, unsigneds,
 //                                         packedStrings, strings
 //   "faults": [

@@ -1,12 +1,22 @@
 // Feeds a model from a folder. Every folder in it that is named <id>-<name> ("1-Studio") is a camera, plugged in when
 // it appears and out when it goes (of several with one id, the first by name). In a camera's folder:
 //
-//   *.jpg *.jpeg *.tif *.tiff *.nef *.ndf *.dat    shot on that camera when they appear, or are there at first; a .nef
-//                                                  and a .jpg of one base name are a pair (see PictureFolder)
+//   *.jpg *.jpeg *.tif *.tiff *.nef *.ndf *.dat    just shot on that camera when they appear; a .nef and a .jpg of one
+//                                                  base name are a pair
 //   roll/                                          what the shutter takes next, by name; when all is taken the camera
 //                                                  makes pictures of its own
 //   camera.json                                    settings and faults (see CameraFile.h); read again when it changes.
 //                                                  A file with an error is ignored, with one line on standard error
+//
+// What lies in a camera's folder when it is first seen is on its card and never announced. What comes while the camera
+// is unplugged is announced at its return, together with what was shot before and not transferred whole. A new file of
+// an old name is a new picture, in roll/ too: made again, copied over, or renamed over it. A picture that is renamed in
+// its folder is no new one.
+//
+// A picture is there when its writer has closed it, or has moved it in. Where that cannot be known (elsewhere than on
+// Linux, in a folder that another computer writes to, while the camera was unplugged) it is there when its time stamp
+// is five seconds old, or has not changed for five seconds; in roll/, at once. To be quicker, and safe from longer
+// pauses, write it under another name and move it.
 //
 // Nothing in the folder is ever changed or removed by the module. A picture has to stay until it is transferred.
 #pragma once
@@ -18,59 +28,75 @@
 #include <string>
 
 #include "CameraFile.h"
+#include "FileState.h"
+#include "FolderEvents.h"
 #include "PictureFolder.h"
 #include "VirtualCamera.h"
 
 namespace virtualcamera {
 
-// What the shutter of a camera without a script takes: its roll, then pictures of its own. Used from whichever thread
-// polls, hence the lock.
+struct FeedOptions {
+  std::shared_ptr<FolderEvents> events = systemFolderEvents();
+  std::chrono::milliseconds rest{5000};
+};
+
+// What the shutter of a camera takes: its roll, then pictures of its own. Used from whichever thread polls, hence the
+// lock.
 class Shutter {
  public:
-  Shutter(std::string name, std::string rollFolder) : name_(std::move(name)), roll_(std::move(rollFolder)) {}
+  Shutter(const std::string& rollFolder, std::shared_ptr<FolderEvents> events)
+      : roll_(rollFolder, std::move(events), std::chrono::milliseconds(0), PictureFolder::First::New) {}
 
+  void setName(const std::string& name);
   void configure(const FileTypes& types, bool pairs);
+  void look();
+  void leave();
   Shot take(uint32_t number);
 
  private:
   std::mutex mutex_;
+  PictureFolder roll_;
   std::string name_;
-  Roll roll_;
-  FileTypes types_;
   bool pairs_ = false;
 };
 
-// One camera of the feed: plugged in by the constructor, out by the destructor.
+// One camera of the feed, which is kept while it is unplugged.
 class CameraFolder {
  public:
-  CameraFolder(Model& model, uint32_t id, const std::string& name, const std::string& path);
+  CameraFolder(Model& model, const FeedOptions& options, uint32_t id, std::string name, const std::string& path);
   ~CameraFolder();
   CameraFolder(const CameraFolder&) = delete;
   CameraFolder& operator=(const CameraFolder&) = delete;
 
+  bool isPlugged() const { return plugged_; }
+  void plugIn();
+  void unplug();
   void look();
 
  private:
-  bool fileChanged();
+  bool fileChanged() const;
   std::optional<CameraFile> readFile();
   void apply(CameraFile file);
   void applySettings(Camera& camera, const CameraFile& file);
 
   Model& model_;
   uint32_t id_;
+  std::string name_;
+  std::string path_;
   std::string filePath_;
-  struct stat fileStatus_ {};
+  FileState fileState_{};
   CameraFile file_;
-  FileTypes types_;
   std::vector<FaultPlan::Id> faults_;
   std::shared_ptr<Shutter> shutter_;
   PictureFolder pictures_;
+  std::vector<Shot> left_;  // on the camera when it was unplugged
+  bool plugged_ = false;
 };
 
 // The model outlives it.
 class FolderFeed {
  public:
-  FolderFeed(Model& model, std::string folder);
+  FolderFeed(Model& model, std::string folder, FeedOptions options = FeedOptions());
 
   // To be called with every poll, from any thread: looks at most every 50 ms, and not while another thread does.
   void look();
@@ -81,6 +107,7 @@ class FolderFeed {
   void listCameras();
 
   Model& model_;
+  FeedOptions options_;
   std::mutex mutex_;
   Clock::time_point nextLook_{};
   FolderWatch watch_;

@@ -7,6 +7,7 @@
 #include <mutex>
 
 #include "FolderFeed.h"
+#include "OwnPicture.h"
 
 #if defined(__GNUC__)
 #define TETHER_EXPORT __attribute__((visibility("default")))
@@ -17,6 +18,8 @@
 namespace virtualcamera {
 namespace {
 
+const char* const kName = "Virtual Camera";
+
 struct Plugin {
   Plugin() : model() {
     const char* folder = std::getenv("TETHER_VIRTUAL_CAMERAS");
@@ -24,9 +27,7 @@ struct Plugin {
       feed.emplace(model, folder);
       return;
     }
-    Camera& camera = model.addCamera(1, "Virtual Camera");
-    auto shutter = std::make_shared<Shutter>("Virtual Camera", std::string());
-    camera.setMaker([shutter](uint32_t number) { return shutter->take(number); });
+    model.addCamera(1, kName).setMaker([](uint32_t number) { return ownShot(number, kName, false); });
   }
 
   Model model;

@@ -168,4 +168,11 @@ std::vector<uint8_t> ownRaw(uint32_t number) {
   return std::move(tiff.bytes);
 }
 
+Shot ownShot(uint32_t number, const std::string& name, bool pair) {
+  Shot shot;
+  if (pair) shot.push_back(Picture::raw(ownRaw(number)));
+  shot.push_back(Picture::jpeg(ownJpeg(number, name, std::time(nullptr))));
+  return shot;
+}
+
 }  // namespace virtualcamera

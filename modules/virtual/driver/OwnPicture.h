@@ -6,7 +6,12 @@
 #include <string>
 #include <vector>
 
+#include "Picture.h"
+
 namespace virtualcamera {
+
+// The next shot of a camera that has no other: a JPEG, or a RAW and JPEG pair, of now. Throws std::bad_alloc.
+Shot ownShot(uint32_t number, const std::string& name, bool pair);
 
 // A JPEG of 960 by 640 dots with number, camera name and local time to be read in it. Throws std::bad_alloc.
 std::vector<uint8_t> ownJpeg(uint32_t number, const std::string& name, std::time_t time);

@@ -3,22 +3,21 @@
 #include <dirent.h>
 
 #include <algorithm>
-#include <cerrno>
 #include <ctime>
 #include <memory>
 
 namespace virtualcamera {
 namespace {
 
-constexpr std::chrono::milliseconds kStill{100};
 constexpr std::chrono::seconds kPairGrace{1};
-constexpr time_t kSettledSeconds = 1;
+constexpr std::chrono::hours kLongAgo{1};
+constexpr std::chrono::seconds kCoarsestTimeStamp{1};
+// Of a folder that has to be listed again and again. A large one takes one part in fifty of a processor at most.
+constexpr std::chrono::milliseconds kListingInterval{250};
+constexpr int kListingShare = 50;
 
-bool olderThanASecond(const struct timespec& time) {
-  struct timespec now {};
-  clock_gettime(CLOCK_REALTIME, &now);
-  const time_t seconds = now.tv_sec - time.tv_sec;
-  return seconds > kSettledSeconds || (seconds == kSettledSeconds && now.tv_nsec > time.tv_nsec);
+bool isOlder(int64_t time, std::chrono::milliseconds age) {
+  return std::chrono::system_clock::now().time_since_epoch() - std::chrono::nanoseconds(time) > age;
 }
 
 std::string baseOf(const std::string& name) { return name.substr(0, name.rfind('.')); }
@@ -28,28 +27,7 @@ bool arePair(uint32_t a, uint32_t b) {
          (a == kNkMAIDFileDataType_JPEG && b == kNkMAIDFileDataType_NEF);
 }
 
-// The RAW comes first, as cameras send it.
-Shot pairOf(Picture a, Picture b) {
-  if (a.fileDataType != kNkMAIDFileDataType_NEF) std::swap(a, b);
-  Shot shot;
-  shot.push_back(std::move(a));
-  shot.push_back(std::move(b));
-  return shot;
-}
-
 }  // namespace
-
-struct timespec modificationTime(const struct stat& status) {
-#ifdef __APPLE__
-  return status.st_mtimespec;
-#else
-  return status.st_mtim;
-#endif
-}
-
-bool sameTime(const struct timespec& a, const struct timespec& b) {
-  return a.tv_sec == b.tv_sec && a.tv_nsec == b.tv_nsec;
-}
 
 std::optional<uint32_t> FileTypes::of(const std::string& name) const {
   static const std::map<std::string, uint32_t> kKnown = {{".jpg", kNkMAIDFileDataType_JPEG},
@@ -71,127 +49,256 @@ std::optional<uint32_t> FileTypes::of(const std::string& name) const {
 
 bool FolderWatch::changed() {
   struct stat status {};
-  if (stat(path_.c_str(), &status) != 0) {
-    settled_ = false;
-    return std::exchange(exists_, false);
-  }
-  const struct timespec modified = modificationTime(status);
-  if (exists_ && settled_ && sameTime(modified, last_)) return false;
+  if (stat(path_.c_str(), &status) != 0) return std::exchange(exists_, false);
+  const int64_t modified = modificationTime(status);
+  const auto now = std::chrono::steady_clock::now();
+  if (exists_ && modified == modified_) return now - since_ < kCoarsestTimeStamp;
   exists_ = true;
-  last_ = modified;
-  settled_ = olderThanASecond(modified);
+  modified_ = modified;
+  since_ = now;
   return true;
 }
 
 std::optional<std::vector<FolderEntry>> entriesOf(const std::string& path) {
   std::vector<FolderEntry> entries;
   const std::unique_ptr<DIR, int (*)(DIR*)> folder(opendir(path.c_str()), closedir);
-  if (!folder) return errno == ENOENT || errno == ENOTDIR ? std::optional(entries) : std::nullopt;
-  while (const dirent* entry = readdir(folder.get()))
-    if (entry->d_name[0] != '.') entries.push_back({entry->d_name, entry->d_ino});
+  if (!folder) return std::nullopt;
+  while (const dirent* entry = readdir(folder.get())) {
+    struct stat status {};
+    if (entry->d_name[0] == '.' || fstatat(dirfd(folder.get()), entry->d_name, &status, 0) != 0) continue;
+    entries.push_back({entry->d_name, status});
+  }
   std::sort(entries.begin(), entries.end(), [](const FolderEntry& a, const FolderEntry& b) { return a.name < b.name; });
   return entries;
 }
 
-std::vector<Shot> PictureFolder::look(const FileTypes& types, bool pairsExpected) {
-  std::vector<Shot> shots;
-  if (watch_.changed()) list(types);
-  if (untaken_ == 0) return shots;
-  for (auto& [name, file] : files_)
-    if (file.state == File::Arriving) watchArrival(name, file);
-  for (auto file = files_.begin(); file != files_.end(); ++file) {
-    if (file->second.state != File::Whole) continue;
-    const auto partner = partnerOf(file->first, file->second);
-    if (!takes(file->second, partner, pairsExpected)) continue;
-    file->second.state = File::Taken;
-    --untaken_;
-    if (partner == files_.end()) {
-      shots.push_back({picture(file)});
-    } else {
-      partner->second.state = File::Taken;
-      --untaken_;
-      shots.push_back(pairOf(picture(file), picture(partner)));
+void PictureFolder::configure(FileTypes types, bool pairsExpected) {
+  types_ = std::move(types);
+  pairsExpected_ = pairsExpected;
+}
+
+void PictureFolder::leave() {
+  events_->unwatch(watch_);
+  watch_ = -1;
+  nextListing_ = {};
+  away_ = false;
+  for (auto& [name, file] : files_) file.writer = File::Unknown;
+}
+
+// What there is.
+
+void PictureFolder::look(bool now) {
+  const std::optional<std::vector<FolderEvent>> events = events_->take(watch_);
+  if (events) apply(*events);
+  struct stat status {};
+  if (stat(path_.c_str(), &status) != 0 || !S_ISDIR(status.st_mode)) {
+    leave();
+    away_ = true;
+    return;
+  }
+  const bool sameFolder = events && status.st_ino == inode_;
+  // The system may tell nothing of what another computer does in a shared folder.
+  const bool untold = sameFolder && events->empty() && modificationTime(status) != modified_;
+  modified_ = modificationTime(status);
+  if (sameFolder) return untold ? list() : void();
+  if (watch_ < 0 && !now && Clock::now() < nextListing_) return;
+  inode_ = status.st_ino;
+  leave();
+  watch_ = events_->watch(path_);
+  list();
+}
+
+// What happens to a file before it is listed is told afterwards. That makes no difference: nothing is handed out in
+// between.
+void PictureFolder::list() {
+  const auto start = Clock::now();
+  if (const std::optional<std::vector<FolderEntry>> entries = entriesOf(path_)) {
+    know(*entries);
+  } else {
+    leave();
+  }
+  const auto end = Clock::now();
+  nextListing_ = end + std::max<Clock::duration>(kListingInterval, kListingShare * (end - start));
+  if (const auto events = events_->take(watch_)) apply(*events);
+}
+
+void PictureFolder::know(const std::vector<FolderEntry>& entries) {
+  Files before;
+  before.swap(files_);
+  for (const auto& [name, status] : entries) {
+    File file;
+    if (!see(file, FileState::of(status))) continue;
+    const auto known = before.find(name);
+    if (known != before.end() && (known->second.writer == File::Writes || known->second.seen.looksLike(file.seen))) {
+      known->second.seen = file.seen;
+      file = known->second;
+      before.erase(known);
+    } else if (!listed_) {
+      first_ == First::New ? becomeWhole(file) : void(file.state = File::Known);
     }
+    files_.emplace(name, file);
+  }
+  Gone gone;
+  while (!before.empty()) forget(before, before.begin(), gone);
+  for (auto& [name, file] : files_)
+    if (file.state == File::Arriving) wasRenamed(file, gone);
+  listed_ = true;
+  idle_ = false;
+}
+
+// False: it has gone, or is no regular file.
+bool PictureFolder::read(const std::string& name, File& file) const {
+  return see(file, FileState::of(path_ + "/" + name));
+}
+
+bool PictureFolder::see(File& file, const std::optional<FileState>& now) {
+  if (!now) return false;
+  if (*now == file.seen) return true;
+  file.seen = *now;
+  file.since = Clock::now();
+  return true;
+}
+
+void PictureFolder::forget(Files& files, Files::iterator file, Gone& gone) const {
+  if (types_.of(file->first)) gone.insert_or_assign(file->second.seen.inode, file->second);
+  files.erase(file);
+}
+
+bool PictureFolder::wasRenamed(File& file, const Gone& gone) {
+  const auto found = gone.find(file.seen.inode);
+  if (found == gone.end() || !(found->second.seen == file.seen)) return false;
+  file = found->second;
+  // Under its old name it cannot be transferred any more.
+  if (!file.handedOut.expired()) becomeWhole(file);
+  return true;
+}
+
+// What happens.
+
+void PictureFolder::apply(const std::vector<FolderEvent>& events) {
+  Gone gone;
+  for (const FolderEvent& event : events) {
+    if (event.name.empty()) away_ = away_ || event.what == FolderEvent::Gone;
+    if (!event.name.empty() && event.name.front() != '.') apply(event, gone);
+  }
+  if (!events.empty()) idle_ = false;
+}
+
+void PictureFolder::apply(const FolderEvent& event, Gone& gone) {
+  const auto known = files_.find(event.name);
+  const bool isKnown = known != files_.end();
+  if (event.what == FolderEvent::Gone) return isKnown ? forget(files_, known, gone) : void();
+  if (event.what == FolderEvent::Appeared && isKnown) return;
+  File file = isKnown && event.what != FolderEvent::MovedIn ? known->second : File();
+  const FileState before = file.seen;
+  if (!read(event.name, file)) {
+    // What happened to its contents does. Otherwise it may only be out of sight, together with its folder.
+    if (event.what == FolderEvent::Changed || event.what == FolderEvent::MovedIn) files_.erase(event.name);
+    return;
+  }
+  switch (event.what) {
+    case FolderEvent::Opened:
+      if (file.writer == File::Done) file.writer = File::Unknown;
+      break;
+    case FolderEvent::Changed:
+      // Nobody can write to what nobody has opened, but cut it, or set its time; nor write now and long ago.
+      if (file.writer != File::Done)
+        file.writer = isOlder(file.seen.modified, kLongAgo) ? File::Suspected : File::Writes;
+      if (file.writer == File::Writes || file.seen.size != before.size) file.state = File::Arriving;
+      break;
+    case FolderEvent::Closed:
+      if (file.state == File::Arriving || file.writer == File::Suspected) becomeWhole(file);
+      file.writer = File::Done;
+      break;
+    case FolderEvent::MovedIn:
+      file.writer = File::Done;
+      if (!wasRenamed(file, gone)) becomeWhole(file);
+      break;
+    default:
+      break;
+  }
+  files_.insert_or_assign(event.name, file);
+}
+
+void PictureFolder::becomeWhole(File& file) {
+  if (file.seen.size == 0) return;
+  file.state = File::Whole;
+  file.since = Clock::now();
+}
+
+bool PictureFolder::rested(const File& file) const {
+  return Clock::now() - file.since >= rest_ || (file.seen.size > 0 && isOlder(file.seen.modified, rest_));
+}
+
+// Of what nobody told that it is whole.
+void PictureFolder::settle() {
+  for (auto& [name, file] : files_) {
+    if (file.state != File::Arriving || file.writer == File::Writes || !rested(file)) continue;
+    if (!read(name, file) || !rested(file)) continue;
+    file.since = Clock::now();
+    becomeWhole(file);
+  }
+}
+
+// What is handed out.
+
+std::vector<Shot> PictureFolder::take(size_t most) {
+  std::vector<Shot> shots;
+  if (idle_) return shots;
+  settle();
+  idle_ = true;
+  for (auto file = files_.begin(); file != files_.end() && shots.size() < most; ++file) {
+    if (file->second.state == File::Known) continue;
+    idle_ = false;
+    if (file->second.state != File::Whole) continue;
+    const std::optional<uint32_t> type = types_.of(file->first);
+    if (!type) {
+      file->second.state = File::Known;
+      continue;
+    }
+    const auto partner = partnerOf(file->first, *type);
+    if (!takes(file->second, *type, partner)) continue;
+    if (Shot shot = handOut(file, partner); !shot.empty()) shots.push_back(std::move(shot));
   }
   return shots;
 }
 
-void PictureFolder::list(const FileTypes& types) {
-  std::optional<std::vector<FolderEntry>> entries = entriesOf(watch_.path());
-  if (!entries) return watch_.retry();
-  Files now;
-  untaken_ = 0;
-  for (FolderEntry& entry : *entries) {
-    const std::optional<uint32_t> type = types.of(entry.name);
-    if (!type) continue;
-    const auto known = files_.find(entry.name);
-    File file;
-    if (known != files_.end() && known->second.inode == entry.inode) {
-      file = known->second;
-    } else {
-      file.inode = entry.inode;
-      file.type = *type;
-    }
-    if (file.state != File::Taken) ++untaken_;
-    now.emplace(std::move(entry.name), file);
-  }
-  files_.swap(now);
-}
-
-void PictureFolder::watchArrival(const std::string& name, File& file) const {
-  struct stat status {};
-  if (stat((watch_.path() + "/" + name).c_str(), &status) != 0 || !S_ISREG(status.st_mode) || status.st_size == 0)
-    return;
-  const auto now = Clock::now();
-  const struct timespec modified = modificationTime(status);
-  if (status.st_size != file.size || !sameTime(modified, file.modified)) {
-    file.size = status.st_size;
-    file.modified = modified;
-    file.since = now;
-  }
-  if (now - file.since < kStill && !olderThanASecond(modified)) return;
-  file.state = File::Whole;
-  file.since = now;
-}
-
 // The other half, as long as it has not been taken by itself.
-PictureFolder::Files::iterator PictureFolder::partnerOf(const std::string& name, const File& file) {
+PictureFolder::Files::iterator PictureFolder::partnerOf(const std::string& name, uint32_t type) {
   const std::string base = baseOf(name);
   for (auto other = files_.lower_bound(base + "."); other != files_.end(); ++other) {
     if (other->first.compare(0, base.size() + 1, base + ".") != 0) break;
-    if (baseOf(other->first) == base && other->second.state != File::Taken && arePair(file.type, other->second.type))
-      return other;
+    const File& file = other->second;
+    const bool comes = file.state == File::Whole ||
+                       (file.state == File::Arriving && (file.writer == File::Writes || file.seen.size > 0));
+    const std::optional<uint32_t> otherType = types_.of(other->first);
+    if (comes && baseOf(other->first) == base && otherType && arePair(type, *otherType)) return other;
   }
   return files_.end();
 }
 
-bool PictureFolder::takes(const File& file, Files::iterator partner, bool pairsExpected) const {
+bool PictureFolder::takes(const File& file, uint32_t type, Files::iterator partner) const {
   if (partner != files_.end()) return partner->second.state == File::Whole;
-  const bool half = file.type == kNkMAIDFileDataType_NEF || file.type == kNkMAIDFileDataType_JPEG;
-  return !pairsExpected || !half || Clock::now() - file.since >= kPairGrace;
+  const bool half = type == kNkMAIDFileDataType_NEF || type == kNkMAIDFileDataType_JPEG;
+  return !pairsExpected_ || !half || Clock::now() - file.since >= kPairGrace;
 }
 
-Picture PictureFolder::picture(Files::iterator file) const {
-  return Picture::file(file->second.type, watch_.path() + "/" + file->first);
-}
-
-Shot Roll::next(const FileTypes& types) {
-  const std::vector<FolderEntry> entries = entriesOf(path_).value_or(std::vector<FolderEntry>());
-  const auto isLeft = [&](const FolderEntry& entry) {
-    return types.of(entry.name) && !taken_.contains({entry.name, entry.inode});
-  };
-  const auto take = [&](const FolderEntry& entry) {
-    taken_.emplace(entry.name, entry.inode);
-    return Picture::file(*types.of(entry.name), path_ + "/" + entry.name);
-  };
-  const auto first = std::find_if(entries.begin(), entries.end(), isLeft);
-  if (first == entries.end()) return {};
-  const auto second = std::find_if(first + 1, entries.end(), [&](const FolderEntry& entry) {
-    return isLeft(entry) && baseOf(entry.name) == baseOf(first->name) &&
-           arePair(*types.of(first->name), *types.of(entry.name));
-  });
-  Picture picture = take(*first);
-  return second == entries.end() ? Shot{std::move(picture)} : pairOf(std::move(picture), take(*second));
+// Nothing where one of them is out of sight all of a sudden; with its folder, perhaps.
+Shot PictureFolder::handOut(Files::iterator file, Files::iterator partner) {
+  Shot shot;
+  for (const auto& half : {file, partner}) {
+    if (half == files_.end()) continue;
+    shot.push_back(Picture::file(*types_.of(half->first), path_ + "/" + half->first));
+    if (!shot.back().source->isThere()) return {};
+  }
+  file->second.state = File::Known;
+  file->second.handedOut = shot.front().source;
+  if (partner == files_.end()) return shot;
+  partner->second.state = File::Known;
+  partner->second.handedOut = shot.back().source;
+  // The RAW comes first, as cameras send it.
+  if (shot.front().fileDataType != kNkMAIDFileDataType_NEF) std::swap(shot.front(), shot.back());
+  return shot;
 }
 
 }  // namespace virtualcamera

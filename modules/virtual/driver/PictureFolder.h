@@ -1,24 +1,22 @@
-// Picture files in a folder: which are there, which have arrived whole, which belong together.
+// Picture files in a folder: which of them are new, which have arrived whole, which belong together.
 #pragma once
 
 #include <sys/stat.h>
-#include <sys/types.h>
 
 #include <chrono>
 #include <cstdint>
 #include <map>
+#include <memory>
 #include <optional>
-#include <set>
 #include <string>
 #include <utility>
 #include <vector>
 
+#include "FileState.h"
+#include "FolderEvents.h"
 #include "Picture.h"
 
 namespace virtualcamera {
-
-struct timespec modificationTime(const struct stat& status);
-bool sameTime(const struct timespec& a, const struct timespec& b);
 
 // What a file with this name is: its file data type, or nothing when it is no picture. Extensions count in any case;
 // hidden files are no pictures. The further extensions are in small letters, with their dot.
@@ -36,71 +34,95 @@ class FolderWatch {
 
   bool changed();
   // The entries could not be read this time: the next look finds them changed again.
-  void retry() { settled_ = false; }
+  void retry() { exists_ = false; }
   const std::string& path() const { return path_; }
 
  private:
   std::string path_;
-  struct timespec last_ {};
+  int64_t modified_ = 0;
+  std::chrono::steady_clock::time_point since_{};  // of the time stamp
   bool exists_ = false;
-  bool settled_ = false;
 };
 
 struct FolderEntry {
   std::string name;
-  ino_t inode;
+  struct stat status {};  // of what a link leads to
 };
-// In the order of their names, without hidden ones; none where there is no such folder. Nothing where it cannot be read
-// at the moment.
+// In the order of their names, without hidden ones. Nothing where the folder cannot be opened. It may be moved away
+// meanwhile: they are the entries of one folder all the same.
 std::optional<std::vector<FolderEntry>> entriesOf(const std::string& path);
 
-// A camera's folder. A file is taken once, by its name and inode, and when it is there whole: its time stamp is more
-// than a second old (it was there before, or was written elsewhere and moved here), or its size and time stamp have
-// been the same for 100 ms. Programs that pause longer while they write do so under a hidden name. An empty file is
-// not there yet. One thread at a time.
+// The new pictures of a folder, each handed out once. New is a file that has appeared, or was written to; not a picture
+// that was renamed within the folder after its transfer, or touched. While nobody looks, and where the system does not
+// tell what happens, a file is known by its name, size and time stamp.
+//
+// A new file is handed out when it is there whole: when its writer has closed it or it was moved here. Where that was
+// not seen it has to be at rest: its time stamp is so old, or has not changed for so long. An empty file is not there
+// yet, and what is no regular file never is. One thread at a time.
 class PictureFolder {
  public:
   using Clock = std::chrono::steady_clock;
+  enum class First { Known, New };  // what is there when it is first looked at
 
-  explicit PictureFolder(std::string path) : watch_(std::move(path)) {}
+  PictureFolder(std::string path, std::shared_ptr<FolderEvents> events, std::chrono::milliseconds rest, First first)
+      : path_(std::move(path)), events_(std::move(events)), rest_(rest), first_(first) {}
+  ~PictureFolder() { leave(); }
+  PictureFolder(const PictureFolder&) = delete;
+  PictureFolder& operator=(const PictureFolder&) = delete;
 
-  // What has been shot since the last look: files in the order of their names, a RAW and a JPEG of one base name
-  // together. A file waits for a partner that is there but not whole yet; when pairs are expected it waits a second
-  // for one to come at all.
-  std::vector<Shot> look(const FileTypes& types, bool pairsExpected);
+  void configure(FileTypes types, bool pairsExpected);
+  // Where there are no events the folder is listed; not every time, unless it is to be now.
+  void look(bool now = false);
+  // So many shots at most of what is new and whole, in the order of their names, a RAW and a JPEG of one base name
+  // together. A file waits for a partner that is on its way; when pairs are expected it waits a second for one to come
+  // at all.
+  std::vector<Shot> take(size_t most);
+  // Nobody looks for a while. What is known of the files is kept.
+  void leave();
+  // Whether the folder is away, or has been since it was last left.
+  bool wasAway() const { return away_; }
 
  private:
   struct File {
-    ino_t inode = 0;
-    uint32_t type = 0;
-    enum { Arriving, Whole, Taken } state = Arriving;
-    off_t size = -1;
-    struct timespec modified {};
-    Clock::time_point since{};  // of the size and time stamp, then of being whole
+    FileState seen{};
+    enum { Arriving, Whole, Known } state = Arriving;
+    // Somebody may have it open; has written to it, or only set its time; has written to it; has closed it.
+    enum { Unknown, Suspected, Writes, Done } writer = Unknown;
+    Clock::time_point since{};  // it looks like this, then: it is whole
+    std::weak_ptr<const PictureSource> handedOut{};
   };
   using Files = std::map<std::string, File>;
+  using Gone = std::map<ino_t, File>;  // pictures that may be back under another name
 
-  void list(const FileTypes& types);
-  void watchArrival(const std::string& name, File& file) const;
-  Files::iterator partnerOf(const std::string& name, const File& file);
-  bool takes(const File& file, Files::iterator partner, bool pairsExpected) const;
-  Picture picture(Files::iterator file) const;
+  void list();
+  void know(const std::vector<FolderEntry>& entries);
+  void apply(const std::vector<FolderEvent>& events);
+  void apply(const FolderEvent& event, Gone& gone);
+  void forget(Files& files, Files::iterator file, Gone& gone) const;
+  static bool wasRenamed(File& file, const Gone& gone);
+  static bool see(File& file, const std::optional<FileState>& now);
+  bool read(const std::string& name, File& file) const;
+  static void becomeWhole(File& file);
+  bool rested(const File& file) const;
+  void settle();
+  Files::iterator partnerOf(const std::string& name, uint32_t type);
+  bool takes(const File& file, uint32_t type, Files::iterator partner) const;
+  Shot handOut(Files::iterator file, Files::iterator partner);
 
-  FolderWatch watch_;
-  Files files_;
-  size_t untaken_ = 0;
-};
-
-// What the shutter takes next: the pictures in a folder, each once, in the order of their names. The files have to be
-// whole when the shutter is fired. One thread at a time.
-class Roll {
- public:
-  explicit Roll(std::string path) : path_(std::move(path)) {}
-  Shot next(const FileTypes& types);  // empty when nothing is left
-
- private:
   std::string path_;
-  std::set<std::pair<std::string, ino_t>> taken_;
+  std::shared_ptr<FolderEvents> events_;
+  std::chrono::milliseconds rest_;
+  First first_;
+  FileTypes types_{};
+  bool pairsExpected_ = false;
+  int watch_ = -1;
+  ino_t inode_ = 0;  // of the folder when it was last looked at, as is its time stamp
+  int64_t modified_ = 0;
+  Clock::time_point nextListing_{};
+  bool away_ = false;
+  bool listed_ = false;
+  bool idle_ = false;  // there is nothing to take or to wait for
+  Files files_{};
 };
 
 }  // namespace virtualcamera

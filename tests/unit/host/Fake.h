@@ -26,15 +26,6 @@ inline constexpr auto kPatience = 60s;
 
 inline Clock::time_point soon() { return Clock::now() + kPatience; }
 
-inline const std::string kAdded = R"({"send": "deviceAdded", "payload": {"device_id": 257, "name": "Cam"}})";
-
-// A camera that is there and lets itself be connected; what it does when the shutter is released.
-inline std::string camera(const std::string& capture) {
-  return R"({"start": [)" + kAdded + R"(], "on": {"connectDevice": [[{"reply": "ok"}]],
-    "getCameraSettings": [[{"reply": "error"}]], "doCapture": )" +
-         capture + "}}";
-}
-
 // For what no event tells: another process's files and life.
 inline bool eventually(const std::function<bool()>& holds) {
   for (const auto until = soon(); !holds(); std::this_thread::sleep_for(2ms)) {

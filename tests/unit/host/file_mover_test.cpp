@@ -1,4 +1,6 @@
-#include "FileMover.h"
+#include "FileSaver.h"
+
+#include <sys/stat.h>
 
 #include <cerrno>
 
@@ -32,7 +34,10 @@ class Broken : public tether::FileCalls {
     room -= count;
     return FileCalls::write(descriptor, bytes, std::min(count, longestWrite));
   }
-  int flush(int descriptor) override { return flushError != 0 ? flushError : FileCalls::flush(descriptor); }
+  int flush(int descriptor) override {
+    if (beforeFlush) beforeFlush(descriptor);
+    return --flushes == 0 ? EIO : FileCalls::flush(descriptor);
+  }
   int remove(const std::string& path) override {
     if (beforeRemove) beforeRemove(path);
     return FileCalls::remove(path);
@@ -41,9 +46,10 @@ class Broken : public tether::FileCalls {
   int renameError = EXDEV;
   int placeError = 0;
   int linkError = 0;
-  int flushError = 0;
+  int flushes = 0;  // the last of so many fails
   std::size_t room = SIZE_MAX / 2;
   std::size_t longestWrite = SIZE_MAX;
+  std::function<void(int)> beforeFlush;
   std::function<void(const std::string&)> beforeRemove;
 };
 
@@ -117,11 +123,11 @@ TEST_F(FileMoverTest, BothFilesOfAPairGetABaseThatIsFreeForBoth) {
   to.write("Capture0001.jpg", "an older shot");
   to.write("Capture0001-2.tif", "another");
   FileMover mover(to.path());
-  const auto raw = mover.move(from.write("r", "raw"), "Capture0001.nef", true);
+  const auto raw = mover.move(from.write("r", "raw"), "Capture0001.nef", {}, true);
   EXPECT_EQ(raw.path, to / "Capture0001-3.nef");
-  const auto jpeg = mover.move(from.write("j", "jpeg"), "Capture0001.jpg", false, raw.base);
+  const auto jpeg = mover.move(from.write("j", "jpeg"), "Capture0001.jpg", {}, false, raw.base);
   EXPECT_EQ(jpeg.path, to / "Capture0001-3.jpg");
-  const auto late = mover.move(from.write("l", "late"), "Capture0001.jpg", false, raw.base);
+  const auto late = mover.move(from.write("l", "late"), "Capture0001.jpg", {}, false, raw.base);
   EXPECT_EQ(late.path, to / "Capture0001-3-2.jpg");
 }
 
@@ -137,16 +143,29 @@ TEST_F(FileMoverTest, CopiesIntoAnotherFileSystem) {
   EXPECT_THAT(from.names(), IsEmpty());
 }
 
-TEST_F(FileMoverTest, TheFirstCopyIsRemovedOnlyWhenTheSecondStandsInItsPlace) {
+TEST_F(FileMoverTest, FlushesTheBytesBeforeTheyHaveTheirNameAndTheFolderBeforeTheFirstCopyGoes) {
   broken.longestWrite = 1000;  // short writes are no failure
-  std::string then;
-  broken.beforeRemove = [&](const std::string& path) {
-    if (path == from / "a.jpg") then = to.read("a.jpg");
+  const auto named = [&](const std::string& what) { return what + (to.names().back() == "a.jpg" ? " named" : ""); };
+  std::vector<std::string> steps;
+  broken.beforeFlush = [&](int descriptor) {
+    struct stat status {};
+    fstat(descriptor, &status);
+    steps.push_back(named(S_ISDIR(status.st_mode) ? "folder" : "bytes"));
   };
-  FileMover mover(to.path(), &broken);
-  EXPECT_TRUE(mover.move(from.write("a.jpg", content), "a.jpg").moved);
-  EXPECT_EQ(then, content);
-  EXPECT_THAT(to.names(), ElementsAre("a.jpg"));
+  broken.beforeRemove = [&](const std::string&) { steps.push_back(named("remove")); };
+  const std::vector<std::string> renamed{"bytes", "folder named"};
+  const std::vector<std::string> copied{"bytes", "bytes", "folder named", "remove named"};
+  const std::vector<std::string> linked{"bytes", "remove named", "folder named"};
+  for (const auto& [error, expected] : {std::pair(0, renamed), std::pair(EXDEV, copied), std::pair(EINVAL, linked)}) {
+    std::filesystem::remove(to / "a.jpg");
+    to.write(".other", "");
+    steps.clear();
+    broken.renameError = error;
+    FileMover mover(to.path(), &broken);
+    EXPECT_TRUE(mover.move(from.write("a.jpg", content), "a.jpg").moved);
+    EXPECT_EQ(steps, expected);
+    EXPECT_EQ(to.read("a.jpg"), content);
+  }
 }
 
 TEST_F(FileMoverTest, WhateverFailsLeavesTheFirstCopyAndNothingInTheFolder) {
@@ -163,8 +182,13 @@ TEST_F(FileMoverTest, WhateverFailsLeavesTheFirstCopyAndNothingInTheFolder) {
   };
   broken.room = 2'000'000;
   failsWith("No space left", to.path());
-  broken.flushError = EIO;
-  failsWith("Input/output error", to.path());
+  for (const auto& [error, flushes] : {std::pair(0, 2), std::pair(EXDEV, 3), std::pair(EINVAL, 2)}) {
+    for (int nth = 1; nth <= flushes; ++nth) {
+      broken.renameError = error;
+      broken.flushes = nth;
+      failsWith("Input/output error", to.path());
+    }
+  }
   broken.placeError = EROFS;
   failsWith("Read-only file system", to.path());
   broken.renameError = EROFS;
@@ -173,6 +197,36 @@ TEST_F(FileMoverTest, WhateverFailsLeavesTheFirstCopyAndNothingInTheFolder) {
     broken.renameError = error;
     failsWith("No such file", to / "gone");
   }
+}
+
+TEST_F(FileMoverTest, ASaverTakesNothingButTheAnnouncedFileOfTheHelpersDirectoryAndKeepsTheOrder) {
+  const auto directory = std::make_shared<const tether::PrivateDirectory>();
+  const auto in = [&](const std::string& name) { return directory->path() + "/" + name; };
+  for (const char* const name : {"a.nef", "a.jpg", "other.jpg"}) std::ofstream(in(name)) << "12345";
+  const std::string outside = from.write("outside.jpg", "12345");
+  std::filesystem::permissions(outside, std::filesystem::perms(0600));
+  to.write("a.jpg", "older");
+  const auto wakeup = std::make_shared<tether::Wakeup>();
+  tether::FileSaver saver(to.path(), wakeup);
+  saver.submit({1, directory, in("a.nef"), "a.nef", 5, 7});
+  saver.submit({2, directory, outside, "b.jpg", 5});
+  saver.submit({3, directory, in("../" + outside.substr(outside.rfind('/') + 1)), "b.jpg", 5});
+  saver.submit({4, directory, in("other.jpg"), "b.jpg", 6});
+  saver.submit({5, directory, in(".record"), "b.jpg", {}});
+  saver.submit({6, directory, in("a.jpg"), "a.jpg", 5, 7});
+  EXPECT_TRUE(saver.waitUntil(fake::soon()));
+  EXPECT_TRUE(wakeup->takeNudge());
+  EXPECT_EQ(saver.pending(), 6U);
+  std::vector<std::uint64_t> moved;
+  for (std::uint64_t ticket = 1; const auto saved = saver.next(); ++ticket) {
+    EXPECT_EQ(saved->ticket, ticket);
+    if (saved->file.moved) moved.push_back(ticket);
+  }
+  EXPECT_THAT(moved, ElementsAre(1U, 6U));
+  EXPECT_THAT(to.names(), ElementsAre("a-2.jpg", "a-2.nef", "a.jpg"));
+  EXPECT_EQ(std::filesystem::status(outside).permissions(), std::filesystem::perms(0600));
+  EXPECT_THAT(directory->tidy(), ElementsAre(in("other.jpg")));
+  std::filesystem::remove_all(directory->path());
 }
 
 }  // namespace

@@ -31,6 +31,7 @@ class SessionTest : public testing::Test {
     options.environment = helper->environment();
     options.silence = silence;
     options.wakeup = wakeup;
+    options.errorDescriptor = errors.write.get();
     session = std::make_unique<Session>(options);
     return *session;
   }
@@ -48,6 +49,7 @@ class SessionTest : public testing::Test {
   }
 
   std::shared_ptr<Wakeup> wakeup = std::make_shared<Wakeup>();
+  Pipe errors = Pipe::make();  // takes what the helper logs
   std::unique_ptr<fake::Helper> helper;
   std::unique_ptr<Session> session;
 };
@@ -58,7 +60,7 @@ TEST_F(SessionTest, NotificationsBecomeTypedEvents) {
     {"send": "deviceRemoved", "payload": {"device_id": 258}},
     {"send": "cameraSettingsChanged", "payload": {"isoSpeed": 400, "shutter": "1/60", "aperture": null}},
     {"send": "objectWasAdded",
-     "payload": {"capture_id": 3, "has_sidecar": 1, "file_name": "Capture0001.nef", "file_size": 3000000000}},
+     "payload": {"capture_id": 3, "has_sidecar": 1, "file_name": "Capture0001.nef", "file_size": -1294967296}},
     {"send": "fileDownloadComplete", "payload": {"capture_id": 3, "file_path": "/x/Capture0001.nef"}},
     {"send": "somethingNew"}, {"send": "deviceAdded", "payload": 5}]})");
   const auto added = next<DeviceAdded>();
@@ -127,19 +129,41 @@ TEST_F(SessionTest, AFrameThatIsNoMessageIsDroppedAndOneThatNeverEndsIsSilence) 
   EXPECT_TRUE(isGone(running.processId()));
 }
 
-TEST_F(SessionTest, AFloodThatNobodyTakesMakesTheHelperWaitAndLosesNothing) {
-  Session& running = start(R"({"heartbeat": 0, "start": [
-    {"repeat": 30000, "do": [{"send": "deviceRemoved", "payload": {"device_id": 1}}]},
-    {"send": "deviceAdded", "payload": {"device_id": 7}}], "on": {"ask": [[{"reply": "ok"}]]}})");
-  helper->process();
-  EXPECT_EQ(running.request("ask", nullptr, soon()).kind, Reply::Kind::kOk);  // behind the flood
-  int removed = 0;
-  for (;; ++removed) {
-    const auto event = running.nextEvent(soon());
-    ASSERT_TRUE(event);
-    if (std::holds_alternative<DeviceAdded>(*event)) break;
+TEST_F(SessionTest, AFloodIsKeptUpToABoundBeyondWhichTheHelperWaitsAndNothingIsLost) {
+  const std::string large(1 << 20, 'x');
+  const std::vector<std::tuple<std::string, int, Reply::Kind>> table{
+      {R"("device_id": 1)", 30'000, Reply::Kind::kOk}, {R"("text": ")" + large + '"', 200, Reply::Kind::kTimeout}};
+  for (const auto& [payload, count, replied] : table) {
+    Session& running = start(R"({"heartbeat": 0, "start": [{"repeat": )" + std::to_string(count) +
+                             R"(, "do": [{"send": "flood", "payload": {)" + payload + R"(}}]}],
+                                "on": {"ask": [[{"reply": "ok"}]]}})");
+    // The reply comes behind the flood.
+    const auto until = replied == Reply::Kind::kOk ? soon() : Clock::now() + 2s;
+    EXPECT_EQ(running.request("ask", nullptr, until).kind, replied);
+    int taken = 0;
+    while (taken < count + (replied == Reply::Kind::kOk ? 0 : 1) && running.nextMessage(soon())) ++taken;
+    EXPECT_EQ(running.request("ask", nullptr, soon()).kind, Reply::Kind::kOk);
   }
-  EXPECT_EQ(removed, 30000);
+}
+
+TEST_F(SessionTest, LinesOfTheLogAreEventsAndKeptAndPassedOnWithoutAWaitForWhoTakesThem) {
+  setNonBlocking(errors.write.get());
+  const std::string filling(4096, 'x');
+  while (write(errors.write.get(), filling.data(), filling.size()) > 0) {
+  }
+  start(R"({"start": [{"repeat": 120, "do": [{"log": "a line"}]}, {"log": "Writing x failed: why"}, {"exit": 3}]})");
+  EXPECT_EQ(next<LogLine>().text, "a line");
+  next<HelperLost>();
+  ASSERT_EQ(session->lastLogLines().size(), 100U);
+  EXPECT_EQ(session->lastLogLines().back().text, "Writing x failed: why");
+  std::string passed;
+  char some[4096];
+  while (passed.find("Writing x failed: why\n") == std::string::npos) {
+    const ssize_t got = read(errors.read.get(), some, sizeof some);
+    ASSERT_GT(got, 0);
+    passed.append(some, static_cast<std::size_t>(got));
+  }
+  EXPECT_THAT(passed, HasSubstr("] a line\n2"));  // stamped, and each a line
 }
 
 TEST_F(SessionTest, WhatCameBeforeTheHelperDiedIsDeliveredBeforeItsLoss) {
@@ -156,7 +180,8 @@ TEST_F(SessionTest, WhatCameBeforeTheHelperDiedIsDeliveredBeforeItsLoss) {
 }
 
 TEST_F(SessionTest, AHelperKilledDuringARequestIsLostAtOnceAndOneThatClosesItsOutputToo) {
-  EXPECT_EQ(start(R"({"on": {"ask": [[{"kill": 9}]]}})").request("ask", nullptr, soon()).kind, Reply::Kind::kLost);
+  EXPECT_EQ(start(R"({"on": {"ask": [[{"orphan": true}, {"kill": 9}]]}})").request("ask", nullptr, soon()).kind,
+            Reply::Kind::kLost);
   EXPECT_THAT(session->lost()->description, HasSubstr("signal 9"));
   EXPECT_TRUE(isGone(session->processId()));
   start(R"({"heartbeat": 0, "ignoresEndOfInput": true, "start": [{"closeOutput": true}]})");
@@ -209,8 +234,8 @@ TEST_F(SessionTest, AHelperThatOverhearsEverythingIsKilledInTheEnd) {
 TEST_F(SessionTest, WhatTheHelperSendsWhileItEndsCanStillBeTaken) {
   start(R"({"on": {"shutdown": [[{"picture": "a.jpg"}, {"exit": 0}]]}})").end(fake::kPatience);
   EXPECT_EQ(next<FileDownloadComplete>().capture_id, 1);
-  EXPECT_EQ(session->directory().tidy(), std::vector<std::string>{session->directory().path() + "/a.jpg"});
-  std::filesystem::remove_all(session->directory().path());
+  EXPECT_EQ(session->directory()->tidy(), std::vector<std::string>{session->directory()->path() + "/a.jpg"});
+  std::filesystem::remove_all(session->directory()->path());
 }
 
 TEST_F(SessionTest, AnInterruptionEndsAWaitAndLeavesTheSessionUsable) {

@@ -1,11 +1,11 @@
 // A folder as cameras: what appears in it, what the shutter takes, what camera.json changes.
 #include <gtest/gtest.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <chrono>
 #include <filesystem>
 #include <fstream>
-#include <set>
 #include <thread>
 
 #include "Client.h"
@@ -15,28 +15,43 @@ namespace virtualcamera::test {
 namespace {
 
 namespace fs = std::filesystem;
+using namespace std::chrono_literals;
 using Ids = std::vector<uint32_t>;
 using Texts = std::vector<std::string>;
 
-struct DriverTest : testing::Test {
-  DriverTest() { fs::create_directories(root); }
-  ~DriverTest() override { fs::remove_all(root); }
+// With what the system tells, and without. Nothing is at rest unless it is dated back.
+struct DriverTest : testing::TestWithParam<bool> {
+  static fs::path made(const fs::path& folder) {
+    fs::create_directories(folder);
+    return folder;
+  }
+  ~DriverTest() override { fs::remove_all(top); }
 
-  void put(const fs::path& name, const std::string& content) const {
+  void dateBack(const fs::path& name) {
+    fs::last_write_time(root / name, fs::file_time_type::clock::now() - 2h - ++written * 1s);
+  }
+  void put(const fs::path& name, const std::string& content) {
     fs::create_directories((root / name).parent_path());
     std::ofstream(root / name, std::ios::binary) << content;
+    dateBack(name);
   }
-  // Written elsewhere and moved in, long ago as far as the time stamp goes.
-  void moveIn(const fs::path& name, const std::string& content) const {
-    put(".arriving", content);
-    fs::last_write_time(root / ".arriving", fs::file_time_type::clock::now() - std::chrono::hours(1));
-    fs::create_directories((root / name).parent_path());
-    fs::rename(root / ".arriving", root / name);
+  void moveIn(const fs::path& name, const std::string& content) {
+    put("new", content);
+    fs::rename(root / "new", root / name);
+  }
+  void remove(const fs::path& name) const { fs::remove(root / name); }
+  void unplug() {
+    fs::rename(root / "1-One", top / "1-One");
+    EXPECT_TRUE(comesTrue([&] { return model.cameras().empty(); }));
+  }
+  void plugIn() {
+    fs::rename(top / "1-One", root / "1-One");
+    EXPECT_TRUE(has(0));
   }
   // Looks until it is so; far longer than it should take.
   template <typename Condition>
   bool comesTrue(Condition condition) {
-    const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(20);
+    const auto end = std::chrono::steady_clock::now() + 20s;
     bool holds = false;
     while (!(holds = condition()) && std::chrono::steady_clock::now() < end) {
       feed.look();
@@ -45,15 +60,34 @@ struct DriverTest : testing::Test {
     return holds;
   }
   bool has(size_t items) {
-    return comesTrue([&] { return model.camera(1) != nullptr && model.camera(1)->items().size() == items; });
+    return comesTrue([&] { return model.camera(1) != nullptr && model.camera(1)->items().size() >= items; });
+  }
+  // Transfers what is there once there are so many; the two of a pair with a sign.
+  Texts taken(size_t pictures) {
+    EXPECT_TRUE(has(pictures));
+    Client module;
+    Client device(module, 1);
+    Texts texts;
+    for (const uint32_t id : model.camera(1)->items()) {
+      Opened open(device, id);
+      const bool pair = open.data.number(kNkMAIDCapability_RawJpegImageStatus) != 0;
+      EXPECT_EQ(open.transfer(), kNkMAIDResult_NoError);
+      texts.push_back((pair ? "+" : "") + open.data.received);
+    }
+    return texts;
   }
 
-  fs::path root = fs::path(testing::TempDir()) / ("virtual-cameras-" + std::to_string(getpid()));
+  const bool told = GetParam();
+  fs::path top = fs::path(testing::TempDir()) / ("virtual-cameras-" + std::to_string(getpid()));
+  fs::path root = made(top / "in");
+  int written = 0;
   Model model;
-  FolderFeed feed{model, root.string()};
+  FolderFeed feed{model, root.string(), {told ? systemFolderEvents() : std::make_shared<FolderEvents>(), 1h}};
 };
 
-TEST_F(DriverTest, FoldersThatAppearAndGoAreCamerasPluggedInAndOut) {
+INSTANTIATE_TEST_SUITE_P(Events, DriverTest, testing::Bool());
+
+TEST_P(DriverTest, FoldersThatAppearAndGoAreCamerasPluggedInAndOut) {
   for (const char* name : {"1-Studio", "none", "2nd"}) fs::create_directory(root / name);
   put("3-file", "no folder");
   EXPECT_TRUE(comesTrue([&] { return model.cameras() == Ids{1}; }));
@@ -61,78 +95,100 @@ TEST_F(DriverTest, FoldersThatAppearAndGoAreCamerasPluggedInAndOut) {
   EXPECT_TRUE(comesTrue([&] { return model.cameras() == Ids{1, 12}; }));
   EXPECT_EQ(model.camera(12)->name(), "Left - right");
   fs::rename(root / "1-Studio", root / "1-Renamed");
-  EXPECT_TRUE(comesTrue([&] { return model.camera(1)->name() == "Renamed"; }));
+  EXPECT_TRUE(comesTrue([&] { return model.camera(1) && model.camera(1)->name() == "Renamed"; }));
+  fs::last_write_time(root, fs::file_time_type::clock::now() + 24h);
+  FolderWatch watch(root);
+  EXPECT_TRUE(comesTrue([&] { return !watch.changed(); })) << "a time stamp in the future keeps it busy";
   fs::remove_all(root);
   EXPECT_TRUE(comesTrue([&] { return model.cameras().empty(); }));
 }
 
-TEST_F(DriverTest, AFileIsShotOnceWhenItIsWholeAndOfAKnownTypeAndAPairWaitsForItsOtherHalf) {
+TEST_P(DriverTest, EveryNewFileIsShotOnceWhenItIsWholeAndWhatTheCameraCameWithNever) {
+  for (const char* name : {"1-One/card.jpg", "1-One/card.nef"}) put(name, "on the card");
+  EXPECT_TRUE(has(0));
+  std::ofstream slow;
+  const std::vector<std::pair<std::function<void()>, Texts>> days{
+      {[&] { put("1-One/a.JPG", "1"); }, {"1"}},
+      {[&] { put("1-One/a.JPG", "2"); }, {"2"}},
+      {[&] { remove("1-One/a.JPG"), put("1-One/a.JPG", "3"); }, {"3"}},
+      {[&] { moveIn("1-One/a.JPG", "4"); }, {"4"}},
+      {[&] { put("1-One/card.jpg", "over the card"); }, {"over the card"}},
+      {[&] { fs::rename(root / "1-One/card.nef", root / "1-One/b.nef"); }, {}},
+      {[&] { told ? dateBack("1-One/a.JPG") : void(); }, {}},
+      {[&] { mkfifo((root / "1-One/pipe.jpg").c_str(), 0600); }, {}},
+      {[&] { fs::create_symlink("loop.jpg", root / "1-One/loop.jpg"); }, {}},
+      {[&] { put("1-One/notes.txt", "no"), put("1-One/.hidden.jpg", "no"), put("1-One/empty.jpg", ""); }, {}},
+      {[&] { put("1-One/empty.jpg", "no more"); }, {"no more"}},
+      {[&] { slow.open(root / "1-One/slow.jpg"), slow << "begin" << std::flush, put("1-One/c.ndf", "5"); }, {"5"}},
+      {[&] { slow << " and end", slow.close(), dateBack("1-One/slow.jpg"); }, {"begin and end"}},
+      {[&] { unplug(), plugIn(); }, {}},
+      {[&] { unplug(), fs::rename(top / "1-One/c.ndf", top / "1-One/d.ndf"), plugIn(); }, {}},
+      {[&] { put("1-One/e.tif", "left"), has(1), unplug(), plugIn(); }, {"left"}},
+      {[&] { put("1-One/f.tif", "deleted"), has(1), unplug(), fs::remove(top / "1-One/f.tif"), plugIn(); }, {}},
+      {[&] { unplug(), put("../1-One/g.jpg", "J"), put("../1-One/g.nef", "R"), plugIn(); }, {"+R", "+J"}},
+      {[&] { put("1-One/last.jpg", "last"); }, {"last"}},
+  };
+  for (size_t day = 0; day < days.size(); ++day) {
+    days[day].first();
+    EXPECT_EQ(taken(days[day].second.size()), days[day].second) << "day " << day;
+  }
+}
+
+TEST_P(DriverTest, AHalfWaitsForItsPartnerAndAPictureThatIsCutIsNotTransferred) {
   put("1-One/camera.json", R"({"pairs": true})");
-  for (const char* name : {"before.JPG", "notes.txt", ".hidden.jpg"}) moveIn(fs::path("1-One") / name, "jpeg");
-  put("1-One/empty.jpg", "");
-  EXPECT_TRUE(has(1));  // once the grace of its other half is over
-  moveIn("1-One/c.ndf", "ndf");
+  EXPECT_TRUE(has(0));
   moveIn("1-One/shot.jpg", "J");
   feed.look();
-  EXPECT_TRUE(has(2));
-  moveIn("1-One/shot.nef", "RR");
-  EXPECT_TRUE(has(4));
-  put("1-One/empty.jpg", "not any more");
-  EXPECT_TRUE(has(5));
-
-  Client module;
-  Client device(module, 1);
-  std::multiset<std::tuple<uint32_t, uint32_t, std::string>> seen;
-  for (const uint32_t id : model.camera(1)->items()) {
-    Opened open(device, id);
-    const uint32_t status = open.data.number(kNkMAIDCapability_RawJpegImageStatus);
-    EXPECT_EQ(open.transfer(), kNkMAIDResult_NoError);
-    seen.emplace(open.data.deliveries[0].fileDataType, status, open.data.received);
+  moveIn("1-One/shot.nef", "R");
+  EXPECT_EQ(taken(2), (Texts{"+R", "+J"}));
+  moveIn("1-One/single.jpg", "S");
+  EXPECT_EQ(taken(1), (Texts{"S"})) << "once the grace of its other half is over";
+  for (const auto& change : {+[](const fs::path& file) { fs::resize_file(file, 35); },
+                             +[](const fs::path& file) { fs::remove(file), mkfifo(file.c_str(), 0600); }}) {
+    moveIn("1-One/cut.ndf", std::string(100, 'x'));
+    EXPECT_TRUE(has(1));
+    change(root / "1-One/cut.ndf");
+    Client module;
+    Client device(module, 1);
+    const uint32_t id = model.camera(1)->items().back();
+    EXPECT_EQ(Opened(device, id).transfer(), kNkMAIDResult_DataTransFailure);
+    EXPECT_EQ(model.camera(1)->items(), Ids{id}) << "still there";
+    model.camera(1)->removeItem(id);
   }
-  EXPECT_EQ(seen, (decltype(seen){{1, 0, "jpeg"}, {1, 0, "not any more"}, {257, 0, "ndf"}, {4, 1, "RR"}, {1, 1, "J"}}));
-  moveIn("1-One/before.JPG", "another file of the same name");
-  EXPECT_TRUE(has(1));
-  moveIn("1-One/cut.jpg", std::string(100, 'x'));
-  EXPECT_TRUE(has(2));
-  ASSERT_EQ(truncate((root / "1-One/cut.jpg").c_str(), 35), 0);
-  EXPECT_EQ(Opened(device, model.camera(1)->items().back()).transfer(), kNkMAIDResult_DataTransFailure);
-  EXPECT_TRUE(has(2));  // not transferred, so still there
 }
 
-TEST_F(DriverTest, TheShutterTakesTheRollThenPicturesOfItsOwn) {
-  moveIn("1-One/roll/b.jpg", "second, JPEG");
-  moveIn("1-One/roll/a.jpg", "first");
-  moveIn("1-One/roll/b.nef", "second, RAW");
+TEST_P(DriverTest, TheShutterTakesTheRollThenPicturesOfItsOwn) {
+  put("1-One/roll/b.jpg", "second, JPEG");
+  put("1-One/roll/a.jpg", "first");
+  put("1-One/roll/b.nef", "second, RAW");
+  mkfifo((root / "1-One/roll/0.jpg").c_str(), 0600);
   EXPECT_TRUE(has(0));
-  Client module;
-  Client device(module, 1);
+  Texts all;
   const auto capture = [&] {
+    Client module;
+    Client device(module, 1);
     device.start(kNkMAIDCapability_Capture);
     EXPECT_EQ(device.finish(), kNkMAIDResult_NoError);
-    return model.camera(1)->items().size();
+    const size_t pictures = model.camera(1)->items().size();
+    for (std::string& text : taken(1)) all.push_back(std::move(text));
+    return pictures;
   };
   for (int shot = 0; shot < 3; ++shot) capture();
+  put("1-One/roll/a.jpg", "over the first");
+  capture();
+  std::ofstream slow(root / "1-One/roll/c.jpg");
+  slow << (told ? "begin" : "") << std::flush;
   put("1-One/camera.json", R"({"pairs": true, "capture": {"completeEvent": false}})");
-  ASSERT_TRUE(comesTrue([&] {
-    const size_t before = model.camera(1)->items().size();
-    return capture() == before + 2;
-  }));
-  std::vector<std::string> taken;
-  for (const uint32_t id : model.camera(1)->items()) {
-    Opened open(device, id);
-    open.transfer();
-    taken.push_back(open.data.received);
-  }
-  EXPECT_EQ(Texts(taken.begin(), taken.begin() + 3), (Texts{"first", "second, RAW", "second, JPEG"}));
-  EXPECT_EQ(taken.rbegin()[1].substr(0, 4), std::string("II*\0", 4));
-  for (const size_t own : {size_t{3}, taken.size() - 1}) {
-    EXPECT_EQ(taken[own].substr(0, 3), "\xff\xd8\xff");
-    EXPECT_EQ(taken[own].substr(taken[own].size() - 2), "\xff\xd9");
-  }
-  EXPECT_NE(taken[3], taken.back()) << "the number is in the picture";
+  ASSERT_TRUE(comesTrue([&] { return capture() == 2; }));
+  const std::string last = all.back(), raw = all.rbegin()[1], own = all[3];
+  all.resize(5), all.erase(all.begin() + 3);
+  EXPECT_EQ(all, (Texts{"first", "+second, RAW", "+second, JPEG", "over the first"}));
+  EXPECT_TRUE(own.starts_with("\xff\xd8\xff") && own.ends_with("\xff\xd9"));
+  EXPECT_TRUE(raw.starts_with(std::string("+II*\0", 5)) && last.starts_with("+\xff\xd8\xff"));
+  EXPECT_TRUE("+" + own != last) << "the number is in the picture";
 }
 
-TEST_F(DriverTest, TheCameraFileIsReadAgainWhenItChangesAndKeptWhenItIsWrong) {
+TEST_P(DriverTest, TheCameraFileIsReadAgainWhenItChangesAndKeptWhenItIsWrong) {
   put("1-One/camera.json", R"({"name": "By file", "settings": {"BatteryLevel": 10, "Capture": null},
                                "faults": [{"object": "camera", "command": "CapGet", "capability": "Name",
                                            "times": 1, "answer": "HardwareError"}]})");
@@ -144,12 +200,21 @@ TEST_F(DriverTest, TheCameraFileIsReadAgainWhenItChangesAndKeptWhenItIsWrong) {
   EXPECT_EQ(device.start(kNkMAIDCapability_Capture), kNkMAIDResult_NotSupported);
   const auto battery = [&] { return device.number(kNkMAIDCapability_BatteryLevel, kNkMAIDDataType_IntegerPtr); };
   EXPECT_EQ(battery(), 10u);
-  testing::internal::CaptureStderr();
-  put("1-One/camera.json", R"({"settings": {"BatteryLevel": )");
-  moveIn("1-One/a.jpg", "looked at after the file");
-  EXPECT_TRUE(has(1));
-  EXPECT_NE(testing::internal::GetCapturedStderr().find("camera.json: "), std::string::npos);
-  EXPECT_EQ(battery(), 10u);
+  const fs::path json = root / "1-One/camera.json";
+  const auto write = [&](const std::string& text) { put("1-One/camera.json", text); };
+  for (const std::function<void()>& spoil : std::initializer_list<std::function<void()>>{
+           [&] { write(R"({"settings": {"BatteryLevel": )"); }, [&] { write(std::string(2 << 20, ' ') + "{}"); },
+           [&] { write(R"({"faults": [{"object": )" + std::string(100'000, '[')); },
+           [&] { remove(json), mkfifo(json.c_str(), 0600); },
+           [&] { remove(json), fs::create_symlink("camera.json", json); }}) {
+    testing::internal::CaptureStderr();
+    spoil();
+    moveIn("1-One/a.jpg", "looked at after the file");
+    EXPECT_EQ(taken(1).size(), 1u);
+    EXPECT_NE(testing::internal::GetCapturedStderr().find("camera.json: "), std::string::npos);
+    EXPECT_EQ(battery(), 10u);
+  }
+  remove(json);
   put("1-One/camera.json", R"({"settings": {"BatteryLevel": 11}})");
   EXPECT_TRUE(comesTrue([&] { return battery() == 11; }));
   EXPECT_EQ(device.start(kNkMAIDCapability_Capture), kNkMAIDResult_Pending);

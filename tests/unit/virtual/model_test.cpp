@@ -1,4 +1,4 @@
-// The model as a client sees it: strict where a client is wrong, asynchronous, and safe between threads.
+// The model as a client sees it: strict where a client is wrong, and safe between threads.
 #include <gtest/gtest.h>
 
 #include <thread>
@@ -9,12 +9,6 @@ namespace virtualcamera::test {
 namespace {
 
 struct ModelTest : testing::Test {
-  static Fault acquire(Fault fault) {
-    fault.level = Level::Data;
-    fault.command = kNkMAIDCommand_CapStart;
-    return fault;
-  }
-
   Model model{{.closeWait = std::chrono::minutes(1)}};
   Camera& camera = model.addCamera(1, "One");
   Client module;
@@ -52,30 +46,6 @@ TEST_F(ModelTest, WhatAClientDoesWrongIsAnsweredWithItsResult) {
   EXPECT_EQ(model.openObjects(), 0u);
 }
 
-TEST_F(ModelTest, WhatAnActionBringsComesInLaterPollsAPieceAPollAndTheCompletionLast) {
-  camera.setTransfer({.deliveryBytes = 400});
-  camera.load(Picture::pattern(kNkMAIDFileDataType_NEF, 1000));
-  EXPECT_EQ(device.start(kNkMAIDCapability_Capture), kNkMAIDResult_Pending);
-  EXPECT_EQ(device.start(kNkMAIDCapability_Capture), kNkMAIDResult_DeviceBusy);
-  device.poll();  // the shutter
-  EXPECT_TRUE(device.events.empty() && device.completions.empty());
-  size_t eventsAtCompletion = 0;
-  device.inCallback = [&] { eventsAtCompletion = device.completions.empty() ? 0 : device.events.size(); };
-  device.poll();
-  EXPECT_EQ(device.events, (Client::Events{{kNkMAIDEvent_AddChild, 1}, {kNkMAIDEvent_CaptureComplete, 0}}));
-  EXPECT_EQ(eventsAtCompletion, 2u);
-  Opened open(device, 1);
-  open.data.start(kNkMAIDCapability_Acquire);
-  for (const size_t expected : {1, 2, 3}) {
-    module.poll();  // not the transfer's
-    open.data.poll();
-    EXPECT_EQ(open.data.deliveries.size(), expected);
-  }
-  EXPECT_TRUE(open.data.completions.empty() && !camera.items().empty());
-  open.item.poll();
-  EXPECT_TRUE(open.data.completions.size() == 1 && camera.items().empty());
-}
-
 TEST_F(ModelTest, EachCallInTurnCanFail) {
   const auto session = [] {
     Client top;
@@ -95,28 +65,26 @@ TEST_F(ModelTest, EachCallInTurnCanFail) {
   EXPECT_EQ(fatal, (std::vector<uint64_t>{1, 4, 7}));
 }
 
-TEST_F(ModelTest, CompletionsStayAwayComeLateTwiceOrAfterTheClose) {
-  // How many have come: after seven polls of the object, after one of the module, after the close and one more.
-  const std::vector<std::pair<Fault, std::vector<size_t>>> table{
-      {acquire({.noCompletion = true}), {0, 0, 0}},
-      {acquire({.completionPolls = 5, .completionTwice = true}), {1, 2, 2}},
-      {acquire({.completionPolls = 6}), {0, 0, 0}},
-      {acquire({.completionAfterClose = true}), {0, 0, 1}}};
-  for (const auto& [fault, expected] : table) {
-    model.faults().clear();
-    model.faults().add(fault);
-    Opened open(device, camera.shoot(Picture::jpeg({1})));
-    open.data.start(kNkMAIDCapability_Acquire);
-    std::vector<size_t> counts;
-    for (int i = 0; i < 7; ++i) open.data.poll();
-    counts.push_back(open.data.completions.size());
-    module.poll();
-    counts.push_back(open.data.completions.size());
-    open.data.close();
-    module.poll();
-    counts.push_back(open.data.completions.size());
-    EXPECT_EQ(counts, expected);
-  }
+TEST_F(ModelTest, AnUnpluggedCameraAnswersTheShotsOfWhichAByteIsMissing) {
+  camera.setTransfer({.deliveryBytes = 400});
+  camera.shootPair(Picture::pattern(kNkMAIDFileDataType_NEF, 1), Picture::jpeg({1, 2}));
+  camera.shootPair(Picture::pattern(kNkMAIDFileDataType_NEF, 3), Picture::jpeg({1, 2, 3, 4}));
+  for (const uint64_t size : {1000, 400}) camera.shoot(Picture::pattern(kNkMAIDFileDataType_NEF, size));
+  EXPECT_EQ(Opened(device, 1).transfer(), kNkMAIDResult_NoError);
+  Opened part(device, 5);
+  part.data.start(kNkMAIDCapability_Acquire);
+  part.data.poll();
+  Opened last(device, 6);
+  std::vector<std::vector<uint64_t>> left;
+  last.data.inCallback = [&] {
+    for (const Shot& shot : model.removeCamera(1)) {
+      left.emplace_back();
+      for (const Picture& picture : shot) left.back().push_back(picture.size());
+    }
+  };
+  last.data.start(kNkMAIDCapability_Acquire);
+  last.data.poll();
+  EXPECT_EQ(left, (decltype(left){{2}, {3, 4}, {1000}}));
 }
 
 TEST_F(ModelTest, CamerasGoWhileOneThreadPollsTheModuleAndAnotherTransfers) {

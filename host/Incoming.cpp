@@ -1,0 +1,154 @@
+#include "Incoming.h"
+
+#include <poll.h>
+
+#include <algorithm>
+
+namespace tether {
+namespace {
+
+using namespace std::chrono_literals;
+
+constexpr std::size_t kMostMemory = std::size_t{64} << 20;
+// What a pipe may hold when its writer has ended, as messages.
+constexpr std::size_t kMostBehindTheEnd = std::size_t{16} << 20;
+// Others may write to the pipe for ever.
+constexpr auto kLongestEnd = 1s;
+
+bool hasBytes(int pipe) {
+  pollfd readable{pipe, POLLIN, 0};
+  return poll(&readable, 1, 0) == 1 && (readable.revents & POLLIN) != 0;
+}
+
+bool isReply(const Message& message) { return message.name == "ok" || message.name == "error"; }
+
+}  // namespace
+
+Incoming::Incoming(Descriptor pipe, std::shared_ptr<Wakeup> wakeup, std::function<void(const Message&)> seen)
+    : _wakeup(std::move(wakeup)), _seen(std::move(seen)) {
+  _thread =
+      platform::Thread::make([this, owned = std::make_shared<Descriptor>(std::move(pipe))] { read(owned->release()); });
+  _thread->start();
+}
+
+Incoming::~Incoming() {
+  {
+    const std::lock_guard guard(_lock);
+    _stops = true;
+  }
+  _changed.notify_all();
+  _thread->cancel();
+  _thread->join();
+}
+
+void Incoming::processEnded() {
+  {
+    const std::lock_guard guard(_lock);
+    _processEnded = true;
+  }
+  _changed.notify_all();
+  _thread->runLoop()->wakeUp();
+}
+
+void Incoming::read(int pipe) {
+  KtRCMessageAccumulator reader(std::make_shared<platform::FileHandle>(pipe));
+  auto& center = platform::NotificationCenter::defaultCenter();
+  const auto available = center.addObserver(std::string(kMessageIsAvailable), &reader, [&](const auto&) {
+    while (auto received = reader.getNextMessage()) keep(messageFrom(std::move(received)));
+  });
+  const auto ended = center.addObserver(std::string(kReadHandleIsFinished), &reader, [this](const auto&) { finish(); });
+  auto until = Clock::time_point::max();
+  for (;;) {
+    {
+      const std::lock_guard guard(_lock);
+      if (_stops || _finished) return;
+      if (_processEnded) until = std::min(until, Clock::now() + kLongestEnd);
+    }
+    if (until != Clock::time_point::max() && (!hasBytes(pipe) || Clock::now() >= until)) return finish();
+    platform::RunLoop::current()->runOnce(until);
+  }
+}
+
+void Incoming::keep(Message message) {
+  const std::size_t memory = memoryOf(message);
+  {
+    std::unique_lock guard(_lock);
+    _heard = Clock::now();
+    const bool beat = message.id == 0 && message.name == "heartbeat";
+    _beatOnce = _beatOnce || beat;
+    // Heartbeats that nobody takes say no more than the last of them.
+    if (beat && !_messages.empty() && _messages.back().name == "heartbeat" && _messages.back().id == 0) return;
+    _full = true;
+    _changed.wait(guard, [this] { return _stops || _processEnded || _memory < kMostMemory; });
+    _full = false;
+    _heard = Clock::now();
+    if (_stops || _memory >= kMostMemory + kMostBehindTheEnd) return;
+  }
+  if (_seen) _seen(message);
+  {
+    const std::lock_guard guard(_lock);
+    _memory += memory;
+    _messages.push_back(std::move(message));
+  }
+  _wakeup->ring();
+}
+
+void Incoming::finish() {
+  {
+    const std::lock_guard guard(_lock);
+    _finished = true;
+  }
+  _changed.notify_all();
+  _wakeup->ring();
+}
+
+bool Incoming::finished() const {
+  const std::lock_guard guard(_lock);
+  return _finished;
+}
+
+bool Incoming::waitUntilFinished(Clock::time_point until) const {
+  std::unique_lock guard(_lock);
+  return _changed.wait_until(guard, until, [this] { return _finished; });
+}
+
+bool Incoming::empty() const {
+  const std::lock_guard guard(_lock);
+  return _messages.empty();
+}
+
+std::optional<Message> Incoming::take() {
+  const std::lock_guard guard(_lock);
+  if (_messages.empty()) return {};
+  Message message = std::move(_messages.front());
+  _messages.pop_front();
+  _memory -= memoryOf(message);
+  _changed.notify_all();
+  return message;
+}
+
+std::optional<Message> Incoming::takeReply(std::int32_t first, std::int32_t last, std::size_t& passed) {
+  const std::lock_guard guard(_lock);
+  for (; passed < _messages.size(); ++passed) {
+    const Message& message = _messages[passed];
+    if (message.id < first || message.id > last || !isReply(message)) continue;
+    Message reply = std::move(_messages[passed]);
+    _messages.erase(_messages.begin() + static_cast<std::ptrdiff_t>(passed));
+    _memory -= memoryOf(reply);
+    _changed.notify_all();
+    return reply;
+  }
+  return {};
+}
+
+bool Incoming::beatOnce() const {
+  const std::lock_guard guard(_lock);
+  return _beatOnce;
+}
+
+Clock::time_point Incoming::heard() const {
+  const std::lock_guard guard(_lock);
+  return _full ? Clock::now() : _heard;
+}
+
+}  // namespace tether
