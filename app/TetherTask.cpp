@@ -9,6 +9,7 @@
 #include "Application.h"
 #include "HostMessages.h"
 #include "Log.h"
+#include "MessageNames.h"
 #include "NikonTetherService.h"
 
 namespace {
@@ -19,9 +20,6 @@ constexpr auto kHeartbeatInterval = 2.0s;
 constexpr auto kFirstIdleDelay = 1.0s;
 constexpr auto kIdleDelay = 0.1s;
 constexpr auto kDispatchDelay = 0.1s;
-constexpr std::size_t kFrameToKeep = 64 * 1024;  // the memory of a longer one is given back with the next
-
-constexpr std::string_view kShutdown = "shutdown";
 
 struct Request {
   std::string_view name;
@@ -30,15 +28,15 @@ struct Request {
 };
 
 constexpr std::array kRequests{
-    Request{"listDevices", &NikonTetherService::listDevices, false},
-    Request{"getDeviceInfo", nullptr, false},
-    Request{"connectDevice", &NikonTetherService::connectDevice, false},
-    Request{"disconnectDevice", &NikonTetherService::disconnectDevice, false},
-    Request{"doCapture", &NikonTetherService::doCapture, true},
-    Request{"downloadThumbnail", nullptr, false},
-    Request{"getCaptureInfo", nullptr, false},
-    Request{"startDownload", nullptr, false},
-    Request{"getCameraSettings", &NikonTetherService::getCameraSettings, true},
+    Request{kMessageListDevices, &NikonTetherService::listDevices, false},
+    Request{kMessageGetDeviceInfo, nullptr, false},
+    Request{kMessageConnectDevice, &NikonTetherService::connectDevice, false},
+    Request{kMessageDisconnectDevice, &NikonTetherService::disconnectDevice, false},
+    Request{kMessageDoCapture, &NikonTetherService::doCapture, true},
+    Request{kMessageDownloadThumbnail, nullptr, false},
+    Request{kMessageGetCaptureInfo, nullptr, false},
+    Request{kMessageStartDownload, nullptr, false},
+    Request{kMessageGetCameraSettings, &NikonTetherService::getCameraSettings, true},
 };
 
 void carryOut(const Request& request, NikonTetherService& service, const CRCMessage& message) {
@@ -100,7 +98,7 @@ void TetherTask::notificationFromAccumulator(const platform::Notification& notif
     });
   } else if (notification.name == kReadHandleIsFinished) {
     // A host may close the pipe as soon as it has asked for the end.
-    if (!_messageAccumulator->hasWaiting(kShutdown)) platform::Application::shared().terminate();
+    if (!_messageAccumulator->hasWaiting(kMessageShutdown)) platform::Application::shared().terminate();
     platform::Application::shared().ignoreEndOfInput();
   }
 }
@@ -117,7 +115,7 @@ void TetherTask::dispatchMessage(CRCMessage* message) {
     carryOut(request, *_tetherService, *message);
     return;
   }
-  if (name == kShutdown) {
+  if (name == kMessageShutdown) {
     platform::Application::shared().ignoreEndOfInput();
     _tetherService.reset();
     platform::Application::shared().terminate();
@@ -143,37 +141,16 @@ void TetherTask::scheduleNextIdle() {
   _idleTimer = platform::Timer::once(kIdleDelay, [this] { timer(); });
 }
 
-void TetherTask::sendHeartbeat() { sendMessage(KtLuaTEString("heartbeat"), 0, nullptr); }
+void TetherTask::sendHeartbeat() { sendMessage(KtLuaTEString(kMessageHeartbeat), 0, nullptr); }
 
 // Frames out.
-
-const platform::Data& TetherTask::luaTableElementToNSData(const KtLuaTE* element) {
-  platform::MutableData& bytes = _encoding.bytes();
-  if (bytes.capacity() > kFrameToKeep) bytes.release();
-  bytes.clear();
-  element->writeToStream(_encodingStream);
-  return bytes;
-}
 
 void TetherTask::sendMessage(const KtLuaTEString& name, std::int32_t id, const KtLuaTETable* data) {
   const platform::Guard guard(_frameLock);
   if (_hostIsGone) return;
-  if (_frame.capacity() > kFrameToKeep) _frame.release();
-  _frame.clear();
-  std::int32_t length = 0;
-  _frame.append(reinterpret_cast<const char*>(&length), sizeof length);
-  _frame.append(reinterpret_cast<const char*>(&id), sizeof id);
-  const KtLuaTENil nothing;
-  const KtLuaTE* const payload = data != nullptr ? static_cast<const KtLuaTE*>(data) : &nothing;
-  for (const KtLuaTE* const element : {static_cast<const KtLuaTE*>(&name), payload}) {
-    const platform::Data& bytes = luaTableElementToNSData(element);
-    _frame.append(bytes.bytes(), bytes.length());
-  }
-  length = static_cast<std::int32_t>(_frame.length() - sizeof length);
-  _frame.replace(0, reinterpret_cast<const char*>(&length), sizeof length);
-
+  const platform::Data& frame = _frameWriter.frame(id, name, data);
   // One write for the whole frame, so that nothing comes between its parts.
-  const int error = _outputFileHandle->write(_frame.bytes(), _frame.length());
+  const int error = _outputFileHandle->write(frame.bytes(), frame.length());
   if (error == 0 || error == ECANCELED) return;
   _hostIsGone = true;
   platform::log("Writing to the host failed, no more is written: %s", std::strerror(error));

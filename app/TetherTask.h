@@ -6,11 +6,10 @@
 
 #include <cstdint>
 #include <memory>
-#include <ostream>
 
 #include "FileHandle.h"
+#include "FrameWriter.h"
 #include "KtLuaTableMarshalling.h"
-#include "KtNSDataStreamBuf.h"
 #include "KtRCMessageAccumulator.h"
 #include "Locks.h"
 #include "NotificationCenter.h"
@@ -46,8 +45,6 @@ class TetherTask {
   void sendMessage(const KtLuaTEString& name, std::int32_t id, const KtLuaTETable* data);
 
  private:
-  // The element's encoding, valid until the next call.
-  const platform::Data& luaTableElementToNSData(const KtLuaTE* element) REQUIRES(_frameLock);
   void notificationFromAccumulator(const platform::Notification& notification);
   void dispatchMessages();
   void dispatchMessage(CRCMessage* message);
@@ -68,10 +65,7 @@ class TetherTask {
   platform::Observer _terminateObserver;
   platform::Observer _wakeObserver;
   platform::Mutex _frameLock;
-  platform::MutableData _frame GUARDED_BY(_frameLock);  // that is being sent, and the memory for the next one
-  // A stream is kept: making one costs more than encoding most elements.
-  KtNSDataWriteStreamBuf _encoding GUARDED_BY(_frameLock);
-  std::ostream _encodingStream GUARDED_BY(_frameLock){&_encoding};
+  FrameWriter _frameWriter GUARDED_BY(_frameLock);
   bool _hostIsGone GUARDED_BY(_frameLock) = false;
   std::shared_ptr<int> _alive = std::make_shared<int>();  // deferred dispatches look whether the task is still there
 };

@@ -6,13 +6,14 @@
 #include <cstring>
 #include <memory>
 #include <msgpack.hpp>
-#include <sstream>
 #include <utility>
 #include <vector>
 
+#include "FrameWriter.h"
 #include "Heap.h"
 #include "KtRCMessageAccumulator.h"
 #include "Measure.h"
+#include "MessageNames.h"
 #include "Suites.h"
 #include "Tables.h"
 
@@ -23,19 +24,6 @@ using Chunks = std::vector<std::shared_ptr<const platform::Data>>;
 constexpr std::size_t kMiB = std::size_t{1} << 20;
 constexpr std::size_t kChunk = 64 * 1024;
 constexpr double kLinear = 2.3;  // for twice the work
-
-std::string frame(const char* name, const KtLuaTE& data) {
-  std::ostringstream body;
-  KtLuaTEString(name).writeToStream(body);
-  data.writeToStream(body);
-  const std::string bytes = body.str();
-  const std::int32_t id = 0;
-  const auto length = static_cast<std::int32_t>(sizeof id + bytes.size());
-  std::string whole(sizeof length + sizeof id, '\0');
-  std::memcpy(whole.data(), &length, sizeof length);
-  std::memcpy(whole.data() + sizeof length, &id, sizeof id);
-  return whole + bytes;
-}
 
 Chunks cut(const std::string& bytes, std::size_t size) {
   Chunks chunks;
@@ -48,9 +36,11 @@ Chunks cut(const std::string& bytes, std::size_t size) {
 
 // A whole frame of that size, cut as reads from a pipe cut it unless told.
 Chunks largeFrame(std::size_t size, std::size_t chunk = kChunk) {
-  const std::size_t around = frame("file", KtLuaTEData("", 0)).size();
+  const KtLuaTEData none("", 0);
+  const std::size_t around = encodeFrame(0, "file", &none).size();
   const std::vector<char> bytes(size - around, 'x');
-  return cut(frame("file", KtLuaTEData(bytes.data(), static_cast<std::int32_t>(bytes.size()))), chunk);
+  const KtLuaTEData all(bytes.data(), static_cast<std::int32_t>(bytes.size()));
+  return cut(encodeFrame(0, "file", &all), chunk);
 }
 
 std::string repeated(const std::string& one, std::size_t count) {
@@ -148,10 +138,10 @@ void addGrowth(Report& report, const std::string& metric, const std::string& ser
 
 void measureFrameReader(Report& report) {
   const auto tables = settings();
-  const std::string heartbeat = frame("heartbeat", KtLuaTENil());
-  compareFrames(report, "heartbeats", 1.0, heartbeat, packedMessage("heartbeat", nullptr));
-  compareFrames(report, "frames of the 7 settings", 2.5, frame("cameraSettingsChanged", tables->ours),
-                packedMessage("cameraSettingsChanged", tables.get()));
+  const std::string heartbeat = encodeFrame(0, kMessageHeartbeat, nullptr);
+  compareFrames(report, "heartbeats", 1.0, heartbeat, packedMessage(kMessageHeartbeat, nullptr));
+  compareFrames(report, "frames of the 7 settings", 2.5, encodeFrame(0, kMessageCameraSettingsChanged, &tables->ours),
+                packedMessage(kMessageCameraSettingsChanged, tables.get()));
 
   const auto large = medians(Count::processor, {reading(largeFrame(32 * kMiB)), copying});
   report.add({"a frame of 32 MiB in chunks of 64 KiB / malloc and memcpy", large[0], large[1], Unit::seconds, 1.5});

@@ -12,11 +12,12 @@
 #include <utility>
 #include <vector>
 
+#include "FrameWriter.h"
 #include "HelperProcess.h"
 #include "KtLuaTableMarshalling.h"
-#include "KtNSDataStreamBuf.h"
 #include "MAID.h"
 #include "Measure.h"
+#include "MessageNames.h"
 #include "Suites.h"
 
 namespace {
@@ -88,7 +89,7 @@ double moduleTime() {
 double startUpTime() {
   const auto start = Clock::now();
   HelperProcess helper(BENCH_HELPER, {});
-  helper.await("deviceAdded");
+  helper.await(kMessageDeviceAdded);
   return since(start);
 }
 
@@ -118,7 +119,7 @@ struct Idle {
 
 Idle idle(const char* program, int cameras) {
   HelperProcess helper(program, {"TETHER_BENCH_CAMERAS=" + std::to_string(cameras)});
-  helper.await("deviceAdded");
+  helper.await(kMessageDeviceAdded);
   const pid_t sleeper = startSleeper();
   std::this_thread::sleep_for(kSettled);
   const auto now = [](pid_t process) { return std::pair(processorTimeOf(process), sleepsOf(process)); };
@@ -143,7 +144,7 @@ void addCameras(Report& report) {
     for (int turn = 0; turn < kTurns; ++turn) {
       const auto start = Clock::now();
       HelperProcess helper(BENCH_HELPER_WITH_PICTURES, {"TETHER_BENCH_CAMERAS=" + std::to_string(cameras)});
-      for (int camera = 0; camera < cameras; ++camera) helper.await("deviceAdded");
+      for (int camera = 0; camera < cameras; ++camera) helper.await(kMessageDeviceAdded);
       times.push_back(since(start));
       memory.push_back(helper.peakMemory());
     }
@@ -155,25 +156,13 @@ void addCameras(Report& report) {
   }
 }
 
-std::string request(const char* name, const KtLuaTE& payload) {
-  KtNSDataWriteStreamBuf buffer;
-  std::ostream out(&buffer);
-  KtLuaTEString(name).writeToStream(out);
-  payload.writeToStream(out);
-  const std::int32_t id = 1;
-  const auto length = static_cast<std::int32_t>(sizeof id + buffer.getNSData()->length());
-  return std::string(reinterpret_cast<const char*>(&length), sizeof length) +
-         std::string(reinterpret_cast<const char*>(&id), sizeof id) +
-         std::string(buffer.getNSData()->bytes(), buffer.getNSData()->length());
-}
-
 // 6 MiB of requests that nothing is done for, and one that is answered.
 std::string smallRequests() {
   std::string all;
-  while (all.size() < kSmallRequests) all += request("getDeviceInfo", KtLuaTENil());
+  while (all.size() < kSmallRequests) all += encodeFrame(1, kMessageGetDeviceInfo, nullptr);
   KtLuaTETable nobody;
-  nobody.Set("device_id", new KtLuaTENumber(kNoCamera));
-  return all + request("connectDevice", nobody);
+  nobody.Set(kKeyDeviceId, new KtLuaTENumber(kNoCamera));
+  return all + encodeFrame(1, kMessageConnectDevice, &nobody);
 }
 
 void addRequests(Report& report) {
@@ -182,7 +171,7 @@ void addRequests(Report& report) {
   std::vector<double> later;
   for (int turn = 0; turn < 5; ++turn) {
     HelperProcess helper(BENCH_HELPER_WITH_PICTURES, {"TETHER_BENCH_CAMERAS=1"});
-    helper.await("deviceAdded");
+    helper.await(kMessageDeviceAdded);
     const auto answered = [&] {
       const auto begin = Clock::now();
       helper.send(requests);

@@ -12,6 +12,7 @@
 
 #include "Heap.h"
 #include "Measure.h"
+#include "MessageNames.h"
 #include "NikonTetherService.h"
 #include "Suites.h"
 #include "TetherTask.h"
@@ -24,10 +25,10 @@ constexpr int kReadEvery = 128;                             // frames, which a p
 
 std::unique_ptr<KtLuaTETable> picture() {
   auto table = std::make_unique<KtLuaTETable>();
-  table->Set("capture_id", new KtLuaTENumber(1));
-  table->Set("has_sidecar", new KtLuaTENumber(0));
-  table->Set("file_name", new KtLuaTEString("Capture0001.jpg"));
-  table->Set("file_size", new KtLuaTENumber(1 << 20));
+  table->Set(kKeyCaptureId, new KtLuaTENumber(1));
+  table->Set(kKeyHasSidecar, new KtLuaTENumber(0));
+  table->Set(kKeyFileName, new KtLuaTEString("Capture0001.jpg"));
+  table->Set(kKeyFileSize, new KtLuaTENumber(1 << 20));
   return table;
 }
 
@@ -118,7 +119,7 @@ void measureTask(Report& report) {
     task.awakeFromNib();
     measureTicks(report);
   }
-  const KtLuaTEString name("objectWasAdded");
+  const KtLuaTEString name(kMessageObjectWasAdded);
   const auto payload = picture();
   const auto sendFrame = [&] { task.sendMessage(name, 0, payload.get()); };
 

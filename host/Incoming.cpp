@@ -20,7 +20,7 @@ bool hasBytes(int pipe) {
   return poll(&readable, 1, 0) == 1 && (readable.revents & POLLIN) != 0;
 }
 
-bool isReply(const Message& message) { return message.name == "ok" || message.name == "error"; }
+bool isReply(const Message& message) { return message.name == kMessageOk || message.name == kMessageError; }
 
 }  // namespace
 
@@ -74,10 +74,10 @@ void Incoming::keep(Message message) {
   {
     std::unique_lock guard(_lock);
     _heard = Clock::now();
-    const bool beat = message.id == 0 && message.name == "heartbeat";
+    const bool beat = message.id == 0 && message.name == kMessageHeartbeat;
     _beatOnce = _beatOnce || beat;
     // Heartbeats that nobody takes say no more than the last of them.
-    if (beat && !_messages.empty() && _messages.back().name == "heartbeat" && _messages.back().id == 0) return;
+    if (beat && !_messages.empty() && _messages.back().name == kMessageHeartbeat && _messages.back().id == 0) return;
     _full = true;
     _changed.wait(guard, [this] { return _stops || _processEnded || _memory < kMostMemory; });
     _full = false;

@@ -1,10 +1,6 @@
 #include "Messages.h"
 
 #include <cmath>
-#include <cstring>
-#include <ostream>
-
-#include "KtNSDataStreamBuf.h"
 
 namespace tether {
 namespace {
@@ -81,44 +77,28 @@ Settings settingsFrom(const KtLuaTE& payload) {
 Event eventFrom(const Message& message) {
   const KtLuaTE& payload = *message.payload;
   if (message.id != 0) return OtherMessage{message.name, message.id};
-  if (message.name == "heartbeat") return Heartbeat{};
-  if (message.name == "deviceAdded") return DeviceAdded{integerIn(payload, "device_id"), textIn(payload, "name")};
-  if (message.name == "deviceRemoved") return DeviceRemoved{integerIn(payload, "device_id")};
-  if (message.name == "cameraSettingsChanged") return SettingsChanged{settingsFrom(payload)};
-  if (message.name == "objectWasAdded") {
+  if (message.name == kMessageHeartbeat) return Heartbeat{};
+  if (message.name == kMessageDeviceAdded)
+    return DeviceAdded{integerIn(payload, kKeyDeviceId), textIn(payload, kKeyName)};
+  if (message.name == kMessageDeviceRemoved) return DeviceRemoved{integerIn(payload, kKeyDeviceId)};
+  if (message.name == kMessageCameraSettingsChanged) return SettingsChanged{settingsFrom(payload)};
+  if (message.name == kMessageObjectWasAdded) {
     constexpr double kLargestExact = 9007199254740992.0;  // 2 to the 53rd
-    auto size = truncated<std::int64_t>(numberIn(payload, "file_size"), kLargestExact);
+    auto size = truncated<std::int64_t>(numberIn(payload, kKeyFileSize), kLargestExact);
     // A helper counts in 32 bits, and does not know that none of them is a sign.
     if (size < 0 && size >= INT32_MIN) size += std::int64_t{1} << 32;
-    return ObjectWasAdded{integerIn(payload, "capture_id"), integerIn(payload, "has_sidecar") != 0,
-                          textIn(payload, "file_name"), size};
+    return ObjectWasAdded{integerIn(payload, kKeyCaptureId), integerIn(payload, kKeyHasSidecar) != 0,
+                          textIn(payload, kKeyFileName), size};
   }
-  if (message.name == "fileDownloadComplete") {
-    return FileDownloadComplete{integerIn(payload, "capture_id"), textIn(payload, "file_path")};
+  if (message.name == kMessageFileDownloadComplete) {
+    return FileDownloadComplete{integerIn(payload, kKeyCaptureId), textIn(payload, kKeyFilePath)};
   }
   return OtherMessage{message.name, 0};
 }
 
-std::string encodeFrame(std::int32_t id, std::string_view name, const KtLuaTE* payload) {
-  KtNSDataWriteStreamBuf buffer;
-  std::ostream out(&buffer);
-  KtLuaTEString(std::string(name)).writeToStream(out);
-  if (payload != nullptr) {
-    payload->writeToStream(out);
-  } else {
-    KtLuaTENil().writeToStream(out);
-  }
-  const auto body = buffer.getNSData();
-  const auto length = static_cast<std::int32_t>(sizeof id + body->length());
-  std::string frame(sizeof length + sizeof id, '\0');
-  std::memcpy(frame.data(), &length, sizeof length);
-  std::memcpy(frame.data() + sizeof length, &id, sizeof id);
-  return frame.append(body->bytes(), body->length());
-}
-
 std::unique_ptr<KtLuaTETable> devicePayload(std::int32_t device) {
   auto table = std::make_unique<KtLuaTETable>();
-  table->Set("device_id", new KtLuaTENumber(device));
+  table->Set(kKeyDeviceId, new KtLuaTENumber(device));
   return table;
 }
 

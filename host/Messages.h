@@ -10,7 +10,9 @@
 #include <variant>
 #include <vector>
 
+#include "FrameWriter.h"
 #include "KtRCMessageAccumulator.h"
+#include "MessageNames.h"
 
 namespace tether {
 
@@ -22,8 +24,8 @@ struct Message {
 };
 
 // The names of the settings, in the order in which Settings holds their values.
-inline constexpr std::array<const char*, 7> kSettingNames = {"isoSpeed", "batteryLevel", "availableShots", "aeMode",
-                                                             "aperture", "shutter",      "whiteBalance"};
+inline constexpr std::array<const char*, 7> kSettingNames = {
+    kKeyIsoSpeed, kKeyBatteryLevel, kKeyAvailableShots, kKeyAeMode, kKeyAperture, kKeyShutter, kKeyWhiteBalance};
 // Nothing where the camera does not tell.
 using SettingValue = std::variant<std::monostate, double, std::string>;
 using Settings = std::array<SettingValue, kSettingNames.size()>;
@@ -86,8 +88,6 @@ Settings settingsFrom(const KtLuaTE& payload);
 std::int32_t integerIn(const KtLuaTE& payload, const char* key);
 std::string textIn(const KtLuaTE& payload, const char* key);
 
-// One frame, ready for the pipe. A null payload becomes a nil element.
-std::string encodeFrame(std::int32_t id, std::string_view name, const KtLuaTE* payload);
 // The table { "device_id" = device }.
 std::unique_ptr<KtLuaTETable> devicePayload(std::int32_t device);
 

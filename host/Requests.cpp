@@ -49,11 +49,11 @@ Reply Session::awaitReply(std::int32_t first, std::int32_t last, Clock::time_poi
                                           : Reply::Kind::kTimeout;
     return reply;
   }
-  reply.kind = message->name == "ok" ? Reply::Kind::kOk : Reply::Kind::kError;
+  reply.kind = message->name == kMessageOk ? Reply::Kind::kOk : Reply::Kind::kError;
   reply.payload = std::move(message->payload);
   if (reply.kind == Reply::Kind::kError) {
-    reply.errorCode = integerIn(*reply.payload, "error_code");
-    reply.errorText = textIn(*reply.payload, "error_description");
+    reply.errorCode = integerIn(*reply.payload, kKeyErrorCode);
+    reply.errorText = textIn(*reply.payload, kKeyErrorDescription);
   }
   return reply;
 }
@@ -64,11 +64,11 @@ Reply Session::request(std::string_view name, const KtLuaTE* payload, Clock::tim
 }
 
 Reply::Kind Session::awaitListing(Clock::time_point until) {
-  send("listDevices");
+  send(kMessageListDevices);
   const std::int32_t first = _nextId;
   std::int32_t last = first;
   for (std::int32_t module = 1; module <= kModules; ++module) {
-    last = send("getCameraSettings", devicePayload(module * kModuleStep).get());
+    last = send(kMessageGetCameraSettings, devicePayload(module * kModuleStep).get());
   }
   std::size_t passed = 0;
   if (waitFor(until, [&] { return _incoming->beatOnce() || _incoming->takeReply(first, last, passed); })) {
@@ -80,13 +80,13 @@ Reply::Kind Session::awaitListing(Clock::time_point until) {
 
 Reply Session::connect(std::int32_t device, Clock::time_point until) {
   const auto payload = devicePayload(device);
-  const std::int32_t id = send("connectDevice", payload.get());
+  const std::int32_t id = send(kMessageConnectDevice, payload.get());
   auto patience = kConnectPatience;
   for (;;) {
     Reply reply = awaitReply(id, id, std::min(until, Clock::now() + patience));
     if (reply.kind != Reply::Kind::kTimeout || Clock::now() >= until) return reply;
     // Requests are dealt with in order: what this one answers holds after the connecting.
-    const std::int32_t asked = send("getCameraSettings", payload.get());
+    const std::int32_t asked = send(kMessageGetCameraSettings, payload.get());
     reply = awaitReply(id, asked, std::min(until, Clock::now() + kAskAgain));
     if (reply.kind != Reply::Kind::kTimeout) return reply;
     patience = kAskAgain;
@@ -97,7 +97,7 @@ Reply Session::settings(std::int32_t device, Clock::time_point until) {
   const auto payload = devicePayload(device);
   const std::int32_t first = _nextId;
   for (;;) {
-    const std::int32_t last = send("getCameraSettings", payload.get());
+    const std::int32_t last = send(kMessageGetCameraSettings, payload.get());
     Reply reply = awaitReply(std::min(first, last), last, std::min(until, Clock::now() + kAskAgain));
     if (reply.kind != Reply::Kind::kTimeout || Clock::now() >= until) return reply;
   }

@@ -74,7 +74,7 @@ void Session::start(const Options& options) {
   // The readers are complete before there is a helper: they cannot miss its end.
   _incoming =
       std::make_unique<Incoming>(std::move(fromHelper.read), _wakeup, [directory = _directory](const Message& message) {
-        if (message.name != "objectWasAdded" && message.name != "fileDownloadComplete") return;
+        if (message.name != kMessageObjectWasAdded && message.name != kMessageFileDownloadComplete) return;
         const Event event = eventFrom(message);
         if (const auto* const object = std::get_if<ObjectWasAdded>(&event)) directory->noteAnnounced(*object);
         if (const auto* const complete = std::get_if<FileDownloadComplete>(&event)) directory->noteComplete(*complete);
@@ -176,7 +176,7 @@ int Session::end(std::chrono::milliseconds grace) {
   std::optional<int> status = _process->waitUntil(Clock::now());
   if (!status && _input && !_lost) {
     const auto until = Clock::now() + grace;
-    if (writeAll(encodeFrame(0, "shutdown", nullptr), until)) status = _process->waitUntil(until);
+    if (writeAll(encodeFrame(0, kMessageShutdown, nullptr), until)) status = _process->waitUntil(until);
   }
   _input.reset();
   if (!status) status = _process->waitUntil(Clock::now() + kEndStep);

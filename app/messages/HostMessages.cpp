@@ -3,6 +3,7 @@
 #include <cstdio>
 
 #include "DebugTrace.h"
+#include "MessageNames.h"
 
 namespace {
 
@@ -20,7 +21,7 @@ void SendErrorMessage(int id, int code, const char* text) {
   } else {
     debugmsgint("SendErrorMessage - error code: %xd", code);
   }
-  data.Set("error_code", new KtLuaTENumber(code));
-  if (text != nullptr) data.Set("error_description", new KtLuaTEString(text));
-  SendMessageToClient(id, "error", &data);
+  data.Set(kKeyErrorCode, new KtLuaTENumber(code));
+  if (text != nullptr) data.Set(kKeyErrorDescription, new KtLuaTEString(text));
+  SendMessageToClient(id, kMessageError, &data);
 }

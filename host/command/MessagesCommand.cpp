@@ -32,7 +32,7 @@ bool showMessages(const Options& options, Console& console, Wakeup& wakeup, Sess
     if (wakeup.interrupted()) throw Failure{kInterrupted, ""};
     if (console.closed()) throw Failure{kUnwritable, ""};
     if (!message && session.lost()) {
-      const bool asked = options.send == "shutdown" && session.lost()->status == 0;
+      const bool asked = options.send == kMessageShutdown && session.lost()->status == 0;
       if (asked && !options.count) return true;
       throw Failure{kHelperLost, session.lost()->description};
     }

@@ -6,6 +6,7 @@
 #include "ContentContainer.h"
 #include "DebugTrace.h"
 #include "Log.h"
+#include "MessageNames.h"
 #include "NameTables.h"
 
 namespace {
@@ -16,10 +17,10 @@ struct Setting {
 };
 
 constexpr Setting kSettings[] = {
-    {"isoSpeed", kNkMAIDCapability_Sensitivity},     {"batteryLevel", kNkMAIDCapability_BatteryLevel},
-    {"availableShots", kNkMAIDCapability_FreeBytes}, {"aeMode", kNkMAIDCapability_ExposureMode},
-    {"aperture", kNkMAIDCapability_Aperture},        {"shutter", kNkMAIDCapability_ShutterSpeed},
-    {"whiteBalance", kNkMAIDCapability_WBMode},
+    {kKeyIsoSpeed, kNkMAIDCapability_Sensitivity},     {kKeyBatteryLevel, kNkMAIDCapability_BatteryLevel},
+    {kKeyAvailableShots, kNkMAIDCapability_FreeBytes}, {kKeyAeMode, kNkMAIDCapability_ExposureMode},
+    {kKeyAperture, kNkMAIDCapability_Aperture},        {kKeyShutter, kNkMAIDCapability_ShutterSpeed},
+    {kKeyWhiteBalance, kNkMAIDCapability_WBMode},
 };
 
 // Values of SaveMedia.

@@ -8,6 +8,7 @@
 #include "DebugTrace.h"
 #include "DeferredCalls.h"
 #include "HostMessages.h"
+#include "MessageNames.h"
 #include "NameTables.h"
 
 namespace {
@@ -76,19 +77,19 @@ CCamera* CNikonModule::addCamera(std::int32_t cameraId) {
   }
   _cameras[cameraId] = camera;
   debugmsgstr("addCamera() - sending message back to host: %s\n", camera->getName().c_str());
-  SendMessageToClient(0, "deviceAdded", cameraInfo(camera).get());
+  SendMessageToClient(0, kMessageDeviceAdded, cameraInfo(camera).get());
   return camera;
 }
 
 std::unique_ptr<KtLuaTETable> CNikonModule::deviceTable(const CCamera* camera) const {
   auto table = std::make_unique<KtLuaTETable>();
-  table->Set("device_id", new KtLuaTENumber(_moduleId | camera->getId()));
+  table->Set(kKeyDeviceId, new KtLuaTENumber(_moduleId | camera->getId()));
   return table;
 }
 
 std::unique_ptr<KtLuaTETable> CNikonModule::cameraInfo(const CCamera* camera) const {
   auto table = deviceTable(camera);
-  table->Set("name", new KtLuaTEString(camera->getName()));
+  table->Set(kKeyName, new KtLuaTEString(camera->getName()));
   return table;
 }
 
@@ -129,7 +130,7 @@ void CNikonModule::removeCamera(CCamera* camera) {
   std::snprintf(line, sizeof line, "scanAndInformHostOfCameraChanges() - removed camera: %s - device id: %d",
                 camera->getName().c_str(), camera->getId());
   debugmsg(line);
-  SendMessageToClient(0, "deviceRemoved", deviceTable(camera).get());
+  SendMessageToClient(0, kMessageDeviceRemoved, deviceTable(camera).get());
   camera->abandonWaits();  // a transfer ends first, but one that never does must not keep the download thread
   _camerasToDelete.push_back(camera);
 }
@@ -151,7 +152,7 @@ void CNikonModule::connectCamera(std::int32_t messageId, std::int32_t cameraId) 
     return;
   }
   _connectedCamera = camera;
-  SendMessageToClient(messageId, "ok", nullptr);
+  SendMessageToClient(messageId, kMessageOk, nullptr);
   updateHostOnCameraSettings();
 }
 
@@ -179,7 +180,7 @@ void CNikonModule::getCameraSettings(std::int32_t messageId, std::int32_t camera
   const std::int32_t result = _connectedCamera->makeCameraSettingsMessage(made);
   const std::unique_ptr<KtLuaTETable> table(made);
   if (result == 0) {
-    SendMessageToClient(messageId, "ok", table.get());
+    SendMessageToClient(messageId, kMessageOk, table.get());
   } else {
     SendErrorMessage(messageId, result, nullptr);
   }
@@ -198,7 +199,7 @@ void CNikonModule::updateHostOnCameraSettings() {
   const std::unique_ptr<KtLuaTETable> table(made);
   if (result != 0) return;
   _lastSettingsUpdate = now;
-  SendMessageToClient(0, "cameraSettingsChanged", table.get());
+  SendMessageToClient(0, kMessageCameraSettingsChanged, table.get());
 }
 
 void DelayUpdateHost(CNikonModule* module, double delay) { CallAfterDelay(DoUpdateHost, module, delay); }

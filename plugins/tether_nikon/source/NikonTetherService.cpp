@@ -8,6 +8,7 @@
 #include "DebugTrace.h"
 #include "FileManager.h"
 #include "HostMessages.h"
+#include "MessageNames.h"
 #include "ModuleLoading.h"
 
 namespace {
@@ -102,7 +103,7 @@ CNikonModule* NikonTetherService::getModuleById(std::int32_t moduleId) const {
 
 std::int32_t NikonTetherService::deviceIdFromTable(KtLuaTE* data) {
   const auto* const table = dynamic_cast<KtLuaTETable*>(data);
-  KtLuaTE* const value = table == nullptr ? nullptr : table->elementForKey(std::string("device_id"));
+  KtLuaTE* const value = table == nullptr ? nullptr : table->elementForKey(std::string(kKeyDeviceId));
   const double number = value == nullptr ? 0.0 : static_cast<double>(*value);
   // A number that does not fit, or is none, is no device's.
   const bool fits = number > std::numeric_limits<std::int32_t>::min() - 1.0 &&
@@ -235,20 +236,20 @@ std::int32_t NikonTetherService::contentIsReadyToDownload(const std::string& fil
                                                           bool hasSidecar) {
   ++_captureId;
   KtLuaTETable table;
-  table.Set("capture_id", new KtLuaTENumber(_captureId));
-  table.Set("has_sidecar", new KtLuaTENumber(hasSidecar ? 1 : 0));
-  table.Set("file_name", new KtLuaTEString(fileName));
-  table.Set("file_size", new KtLuaTENumber(fileSize));
+  table.Set(kKeyCaptureId, new KtLuaTENumber(_captureId));
+  table.Set(kKeyHasSidecar, new KtLuaTENumber(hasSidecar ? 1 : 0));
+  table.Set(kKeyFileName, new KtLuaTEString(fileName));
+  table.Set(kKeyFileSize, new KtLuaTENumber(fileSize));
   debugmsgint("sending objectWasAdded message with capture ID: %d", _captureId);
-  SendMessageToClient(0, "objectWasAdded", &table);
+  SendMessageToClient(0, kMessageObjectWasAdded, &table);
   return _captureId;
 }
 
 void NikonTetherService::fileDownloadComplete(std::int32_t captureId, const std::string& path) {
   KtLuaTETable table;
-  table.Set("capture_id", new KtLuaTENumber(captureId));
-  table.Set("file_path", new KtLuaTEString(path));
-  SendMessageToClient(0, "fileDownloadComplete", &table);
+  table.Set(kKeyCaptureId, new KtLuaTENumber(captureId));
+  table.Set(kKeyFilePath, new KtLuaTEString(path));
+  SendMessageToClient(0, kMessageFileDownloadComplete, &table);
 }
 
 std::string& NikonTetherService::getTemporaryDirectoryPath() const { return gTemporaryDirectoryPath; }

@@ -174,7 +174,7 @@ class FakeHelper {
  private:
   static void send(std::int32_t id, const std::string& name, const json& payload) {
     const std::unique_ptr<KtLuaTE> value(element(payload));
-    const std::string frame = tether::encodeFrame(id, name, value.get());
+    const std::string frame = encodeFrame(id, name, value.get());
     platform::FileHandle::standardOutput()->write(frame.data(), frame.size());
   }
 
