@@ -24,7 +24,7 @@ void Descriptor::reset() {
 }
 
 Pipe Pipe::make() {
-  const std::lock_guard guard(spawnLock());
+  const platform::Guard guard(spawnLock());
   std::array<int, 2> ends{};
   if (pipe(ends.data()) != 0) throw std::system_error(errno, std::generic_category(), "no pipe to be had");
   Descriptor read(ends[0]);
@@ -34,8 +34,8 @@ Pipe Pipe::make() {
 
 void setNonBlocking(int descriptor) { fcntl(descriptor, F_SETFL, fcntl(descriptor, F_GETFL) | O_NONBLOCK); }
 
-std::mutex& spawnLock() {
-  static std::mutex lock;
+platform::Mutex& spawnLock() {
+  static platform::Mutex lock;
   return lock;
 }
 

@@ -1,8 +1,9 @@
 // Descriptors with an owner. Everything made here is closed on exec and numbered above standard error.
 #pragma once
 
-#include <mutex>
 #include <utility>
+
+#include "Locks.h"
 
 namespace tether {
 
@@ -42,6 +43,6 @@ struct Pipe {
 void setNonBlocking(int descriptor);
 
 // Held while a descriptor is being made that is not closed on exec yet, and while a child is being started.
-std::mutex& spawnLock();
+platform::Mutex& spawnLock();
 
 }  // namespace tether

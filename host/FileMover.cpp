@@ -59,7 +59,7 @@ Descriptor makeHidden(const std::string& folder, std::string& path) {
     path = platform::appendingPathComponent(folder, std::string(kCopyPrefix).append(kCopySuffix));
     Descriptor file;
     {
-      const std::lock_guard guard(spawnLock());
+      const platform::Guard guard(spawnLock());
       file = Descriptor(mkstemp(path.data()));
       if (file) fcntl(file.get(), F_SETFD, FD_CLOEXEC);
     }

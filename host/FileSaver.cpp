@@ -12,23 +12,23 @@ FileSaver::FileSaver(std::string folder, std::shared_ptr<Wakeup> wakeup, FileCal
 
 FileSaver::~FileSaver() {
   {
-    const std::lock_guard guard(_lock);
+    const platform::Guard guard(_lock);
     _ends = true;
   }
-  _changed.notify_all();
+  _changed.notifyAll();
   _thread.join();
 }
 
 void FileSaver::submit(Job job) {
   {
-    const std::lock_guard guard(_lock);
+    const platform::Guard guard(_lock);
     _jobs.push_back(std::move(job));
   }
-  _changed.notify_all();
+  _changed.notifyAll();
 }
 
 std::optional<FileSaver::Saved> FileSaver::next() {
-  const std::lock_guard guard(_lock);
+  const platform::Guard guard(_lock);
   if (_done.empty()) return {};
   Saved saved = std::move(_done.front());
   _done.pop_front();
@@ -36,20 +36,20 @@ std::optional<FileSaver::Saved> FileSaver::next() {
 }
 
 std::size_t FileSaver::pending() const {
-  const std::lock_guard guard(_lock);
+  const platform::Guard guard(_lock);
   return _jobs.size() + _done.size();
 }
 
 void FileSaver::collectLeftovers() {
   {
-    const std::lock_guard guard(_lock);
+    const platform::Guard guard(_lock);
     _collects = true;
   }
-  _changed.notify_all();
+  _changed.notifyAll();
 }
 
 std::optional<Leftover> FileSaver::nextLeftover() {
-  const std::lock_guard guard(_lock);
+  const platform::Guard guard(_lock);
   if (_told.empty()) return {};
   Leftover leftover = std::move(_told.front());
   _told.pop_front();
@@ -57,8 +57,9 @@ std::optional<Leftover> FileSaver::nextLeftover() {
 }
 
 bool FileSaver::waitUntil(Clock::time_point until) {
-  std::unique_lock guard(_lock);
-  return _changed.wait_until(guard, until, [this] { return _jobs.empty() && !_collects; });
+  const platform::Guard guard(_lock);
+  while ((!_jobs.empty() || _collects) && _changed.waitUntil(_lock, until)) continue;
+  return _jobs.empty() && !_collects;
 }
 
 void FileSaver::run() {
@@ -66,26 +67,30 @@ void FileSaver::run() {
   sigset_t all;
   sigfillset(&all);
   pthread_sigmask(SIG_BLOCK, &all, nullptr);
-  std::unique_lock guard(_lock);
+  const platform::Guard guard(_lock);
   for (;;) {
-    _changed.wait(guard, [this] { return _ends || _collects || !_jobs.empty(); });
+    while (!_ends && !_collects && _jobs.empty()) _changed.wait(_lock);
     if (!_jobs.empty()) {
       const Job& job = _jobs.front();  // stays where it is while others are added behind it
-      guard.unlock();
-      Saved saved{job.ticket, save(job)};
-      guard.lock();
+      Saved saved{job.ticket, {}};
+      {
+        const platform::Release meanwhile(_lock);
+        saved.file = save(job);
+      }
       _done.push_back(std::move(saved));
       _jobs.pop_front();
     } else if (_ends) {
       return;
     } else {
-      guard.unlock();
-      auto leftover = _leftovers.next();
-      guard.lock();
+      std::optional<Leftover> leftover;
+      {
+        const platform::Release meanwhile(_lock);
+        leftover = _leftovers.next();
+      }
       _collects = leftover.has_value();
       if (leftover) _told.push_back(*std::move(leftover));
     }
-    _changed.notify_all();
+    _changed.notifyAll();
     if (_wakeup) _wakeup->nudge();
   }
 }

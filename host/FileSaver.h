@@ -7,18 +7,17 @@
 // Between the jobs it deals with what processes left behind that were killed, if asked to.
 #pragma once
 
-#include <condition_variable>
 #include <cstdint>
 #include <deque>
 #include <map>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <string>
 #include <thread>
 
 #include "FileMover.h"
 #include "Leftovers.h"
+#include "Locks.h"
 #include "PrivateDirectory.h"
 #include "Wakeup.h"
 
@@ -75,13 +74,13 @@ class FileSaver {
   std::shared_ptr<Wakeup> _wakeup;
   std::map<std::uint64_t, std::string> _bases;  // of pairs; the thread's own
 
-  mutable std::mutex _lock;
-  std::condition_variable _changed;
-  std::deque<Job> _jobs;  // the first is being done
-  std::deque<Saved> _done;
-  std::deque<Leftover> _told;
-  bool _collects = false;
-  bool _ends = false;
+  mutable platform::Mutex _lock;
+  platform::Condition _changed;
+  std::deque<Job> _jobs GUARDED_BY(_lock);  // the first is being done
+  std::deque<Saved> _done GUARDED_BY(_lock);
+  std::deque<Leftover> _told GUARDED_BY(_lock);
+  bool _collects GUARDED_BY(_lock) = false;
+  bool _ends GUARDED_BY(_lock) = false;
   std::thread _thread;
 };
 

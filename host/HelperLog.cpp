@@ -52,7 +52,7 @@ HelperLog::HelperLog(Descriptor pipe, int target, std::shared_ptr<Wakeup> wakeup
 
 HelperLog::~HelperLog() {
   {
-    const std::lock_guard guard(_lock);
+    const platform::Guard guard(_lock);
     _stops = true;
   }
   _bell.write.reset();
@@ -61,7 +61,7 @@ HelperLog::~HelperLog() {
 
 void HelperLog::processEnded() {
   {
-    const std::lock_guard guard(_lock);
+    const platform::Guard guard(_lock);
     _processEnded = true;
   }
   const char byte = 0;
@@ -83,7 +83,7 @@ void HelperLog::run() {
     std::array<char, 16> rings{};
     if ((watched[0].revents & POLLIN) != 0) (void)!read(_bell.read.get(), rings.data(), rings.size());
     {
-      const std::lock_guard guard(_lock);
+      const platform::Guard guard(_lock);
       if (_stops) break;
       if (_processEnded) until = std::min(until, Clock::now() + kLongestEnd);
     }
@@ -128,7 +128,7 @@ void HelperLog::keep(std::string_view bytes) {
 void HelperLog::keepLine() {
   if (_line.empty()) return;
   {
-    const std::lock_guard guard(_lock);
+    const platform::Guard guard(_lock);
     _lines.push_back({std::string(withoutStamp(_line))});
     ++_untaken;
     if (_lines.size() > kMostLines) _lines.pop_front();
@@ -153,30 +153,31 @@ void HelperLog::passOn() {
 void HelperLog::finish() {
   keepLine();
   {
-    const std::lock_guard guard(_lock);
+    const platform::Guard guard(_lock);
     _finished = true;
   }
-  _changed.notify_all();
+  _changed.notifyAll();
 }
 
 bool HelperLog::waitUntilFinished(Clock::time_point until) const {
-  std::unique_lock guard(_lock);
-  return _changed.wait_until(guard, until, [this] { return _finished; });
+  const platform::Guard guard(_lock);
+  while (!_finished && _changed.waitUntil(_lock, until)) continue;
+  return _finished;
 }
 
 std::optional<LogLine> HelperLog::take() {
-  const std::lock_guard guard(_lock);
+  const platform::Guard guard(_lock);
   if (_untaken == 0) return {};
   return _lines[_lines.size() - _untaken--];
 }
 
 bool HelperLog::empty() const {
-  const std::lock_guard guard(_lock);
+  const platform::Guard guard(_lock);
   return _untaken == 0;
 }
 
 std::vector<LogLine> HelperLog::lastLines() const {
-  const std::lock_guard guard(_lock);
+  const platform::Guard guard(_lock);
   return {_lines.begin(), _lines.end()};
 }
 
@@ -185,7 +186,7 @@ Descriptor openForLog(const std::string& path) {
   const bool fifo = stat(path.c_str(), &status) == 0 && S_ISFIFO(status.st_mode);
   // To write alone, a FIFO without a reader cannot be opened, and is at its end whenever a reader goes.
   const int access = fifo ? O_RDWR : O_WRONLY;
-  const std::lock_guard guard(spawnLock());
+  const platform::Guard guard(spawnLock());
   Descriptor file(open(path.c_str(), access | O_CREAT | O_APPEND | O_NONBLOCK | O_NOCTTY | O_CLOEXEC, 0666));
   if (!file) throw std::system_error(errno, std::generic_category(), path);
   return file;

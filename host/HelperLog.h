@@ -2,10 +2,8 @@
 // kept. The helper never waits for whom it is passed on to.
 #pragma once
 
-#include <condition_variable>
 #include <deque>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -13,6 +11,7 @@
 #include <vector>
 
 #include "Descriptors.h"
+#include "Locks.h"
 #include "Messages.h"
 #include "Wakeup.h"
 
@@ -58,13 +57,13 @@ class HelperLog {
   std::string _waiting;  // to be passed on
   int _dropped = 0;
 
-  mutable std::mutex _lock;
-  mutable std::condition_variable _changed;
-  std::deque<LogLine> _lines;
-  std::size_t _untaken = 0;  // of the lines, at the end
-  bool _processEnded = false;
-  bool _finished = false;
-  bool _stops = false;
+  mutable platform::Mutex _lock;
+  mutable platform::Condition _changed;
+  std::deque<LogLine> _lines GUARDED_BY(_lock);
+  std::size_t _untaken GUARDED_BY(_lock) = 0;  // of the lines, at the end
+  bool _processEnded GUARDED_BY(_lock) = false;
+  bool _finished GUARDED_BY(_lock) = false;
+  bool _stops GUARDED_BY(_lock) = false;
   std::thread _thread;
 };
 

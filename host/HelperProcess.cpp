@@ -101,7 +101,7 @@ HelperProcess::HelperProcess(const Start& start) {
   const Attributes attributes;
   int error = 0;
   {
-    const std::lock_guard guard(spawnLock());
+    const platform::Guard guard(spawnLock());
     error = posix_spawn(&_pid, start.executable.c_str(), actions.get(), attributes.get(), pointersTo(arguments).data(),
                         pointersTo(environment).data());
   }
@@ -126,24 +126,24 @@ void HelperProcess::reap(const std::function<void()>& ended) {
   while (waitid(P_PID, static_cast<id_t>(_pid), &ignored, WEXITED | WNOWAIT) != 0 && errno == EINTR) {
   }
   {
-    const std::lock_guard guard(_lock);
+    const platform::Guard guard(_lock);
     int status = 0;
     while (waitpid(_pid, &status, 0) < 0 && errno == EINTR) {
     }
     _status = status;
-    _changed.notify_all();
+    _changed.notifyAll();
   }
   if (ended) ended();
 }
 
 std::optional<int> HelperProcess::waitUntil(Clock::time_point until) {
-  std::unique_lock guard(_lock);
-  _changed.wait_until(guard, until, [this] { return _status.has_value(); });
+  const platform::Guard guard(_lock);
+  while (!_status && _changed.waitUntil(_lock, until)) continue;
   return _status;
 }
 
 void HelperProcess::signal(int number) {
-  const std::lock_guard guard(_lock);
+  const platform::Guard guard(_lock);
   if (!_status) kill(_pid, number);
 }
 
@@ -151,8 +151,8 @@ int HelperProcess::stop(std::chrono::milliseconds grace) {
   signal(SIGTERM);
   waitUntil(Clock::now() + grace);
   signal(SIGKILL);
-  std::unique_lock guard(_lock);
-  _changed.wait(guard, [this] { return _status.has_value(); });
+  const platform::Guard guard(_lock);
+  while (!_status) _changed.wait(_lock);
   return *_status;
 }
 

@@ -4,15 +4,14 @@
 #include <sys/types.h>
 
 #include <chrono>
-#include <condition_variable>
 #include <functional>
-#include <mutex>
 #include <optional>
 #include <stdexcept>
 #include <string>
 #include <thread>
 #include <vector>
 
+#include "Locks.h"
 #include "RunLoop.h"
 
 namespace tether {
@@ -64,9 +63,9 @@ class HelperProcess {
   void reap(const std::function<void()>& ended);
 
   pid_t _pid = -1;
-  std::mutex _lock;
-  std::condition_variable _changed;
-  std::optional<int> _status;
+  platform::Mutex _lock;
+  platform::Condition _changed;
+  std::optional<int> _status GUARDED_BY(_lock);
   std::thread _reaper;
 };
 

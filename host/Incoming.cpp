@@ -33,20 +33,20 @@ Incoming::Incoming(Descriptor pipe, std::shared_ptr<Wakeup> wakeup, std::functio
 
 Incoming::~Incoming() {
   {
-    const std::lock_guard guard(_lock);
+    const platform::Guard guard(_lock);
     _stops = true;
   }
-  _changed.notify_all();
+  _changed.notifyAll();
   _thread->cancel();
   _thread->join();
 }
 
 void Incoming::processEnded() {
   {
-    const std::lock_guard guard(_lock);
+    const platform::Guard guard(_lock);
     _processEnded = true;
   }
-  _changed.notify_all();
+  _changed.notifyAll();
   _thread->runLoop()->wakeUp();
 }
 
@@ -60,7 +60,7 @@ void Incoming::read(int pipe) {
   auto until = Clock::time_point::max();
   for (;;) {
     {
-      const std::lock_guard guard(_lock);
+      const platform::Guard guard(_lock);
       if (_stops || _finished) return;
       if (_processEnded) until = std::min(until, Clock::now() + kLongestEnd);
     }
@@ -72,21 +72,21 @@ void Incoming::read(int pipe) {
 void Incoming::keep(Message message) {
   const std::size_t memory = memoryOf(message);
   {
-    std::unique_lock guard(_lock);
+    const platform::Guard guard(_lock);
     _heard = Clock::now();
     const bool beat = message.id == 0 && message.name == kMessageHeartbeat;
     _beatOnce = _beatOnce || beat;
     // Heartbeats that nobody takes say no more than the last of them.
     if (beat && !_messages.empty() && _messages.back().name == kMessageHeartbeat && _messages.back().id == 0) return;
     _full = true;
-    _changed.wait(guard, [this] { return _stops || _processEnded || _memory < kMostMemory; });
+    while (!_stops && !_processEnded && _memory >= kMostMemory) _changed.wait(_lock);
     _full = false;
     _heard = Clock::now();
     if (_stops || _memory >= kMostMemory + kMostBehindTheEnd) return;
   }
   if (_seen) _seen(message);
   {
-    const std::lock_guard guard(_lock);
+    const platform::Guard guard(_lock);
     _memory += memory;
     _messages.push_back(std::move(message));
   }
@@ -95,59 +95,60 @@ void Incoming::keep(Message message) {
 
 void Incoming::finish() {
   {
-    const std::lock_guard guard(_lock);
+    const platform::Guard guard(_lock);
     _finished = true;
   }
-  _changed.notify_all();
+  _changed.notifyAll();
   _wakeup->ring();
 }
 
 bool Incoming::finished() const {
-  const std::lock_guard guard(_lock);
+  const platform::Guard guard(_lock);
   return _finished;
 }
 
 bool Incoming::waitUntilFinished(Clock::time_point until) const {
-  std::unique_lock guard(_lock);
-  return _changed.wait_until(guard, until, [this] { return _finished; });
+  const platform::Guard guard(_lock);
+  while (!_finished && _changed.waitUntil(_lock, until)) continue;
+  return _finished;
 }
 
 bool Incoming::empty() const {
-  const std::lock_guard guard(_lock);
+  const platform::Guard guard(_lock);
   return _messages.empty();
 }
 
 std::optional<Message> Incoming::take() {
-  const std::lock_guard guard(_lock);
+  const platform::Guard guard(_lock);
   if (_messages.empty()) return {};
   Message message = std::move(_messages.front());
   _messages.pop_front();
   _memory -= memoryOf(message);
-  _changed.notify_all();
+  _changed.notifyAll();
   return message;
 }
 
 std::optional<Message> Incoming::takeReply(std::int32_t first, std::int32_t last, std::size_t& passed) {
-  const std::lock_guard guard(_lock);
+  const platform::Guard guard(_lock);
   for (; passed < _messages.size(); ++passed) {
     const Message& message = _messages[passed];
     if (message.id < first || message.id > last || !isReply(message)) continue;
     Message reply = std::move(_messages[passed]);
     _messages.erase(_messages.begin() + static_cast<std::ptrdiff_t>(passed));
     _memory -= memoryOf(reply);
-    _changed.notify_all();
+    _changed.notifyAll();
     return reply;
   }
   return {};
 }
 
 bool Incoming::beatOnce() const {
-  const std::lock_guard guard(_lock);
+  const platform::Guard guard(_lock);
   return _beatOnce;
 }
 
 Clock::time_point Incoming::heard() const {
-  const std::lock_guard guard(_lock);
+  const platform::Guard guard(_lock);
   return _full ? Clock::now() : _heard;
 }
 

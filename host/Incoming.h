@@ -3,14 +3,13 @@
 // What nobody takes is kept up to 64 MiB of memory, whoever waits for what; beyond it the helper is made to wait.
 #pragma once
 
-#include <condition_variable>
 #include <deque>
 #include <functional>
 #include <memory>
-#include <mutex>
 #include <optional>
 
 #include "Descriptors.h"
+#include "Locks.h"
 #include "Messages.h"
 #include "Thread.h"
 #include "Wakeup.h"
@@ -56,16 +55,16 @@ class Incoming {
   std::shared_ptr<Wakeup> _wakeup;
   std::function<void(const Message&)> _seen;
 
-  mutable std::mutex _lock;
-  mutable std::condition_variable _changed;
-  std::deque<Message> _messages;
-  std::size_t _memory = 0;  // that the messages take
-  bool _full = false;       // the reading thread waits
-  bool _beatOnce = false;
-  bool _processEnded = false;
-  bool _finished = false;
-  bool _stops = false;
-  Clock::time_point _heard = Clock::now();
+  mutable platform::Mutex _lock;
+  mutable platform::Condition _changed;
+  std::deque<Message> _messages GUARDED_BY(_lock);
+  std::size_t _memory GUARDED_BY(_lock) = 0;  // that the messages take
+  bool _full GUARDED_BY(_lock) = false;       // the reading thread waits
+  bool _beatOnce GUARDED_BY(_lock) = false;
+  bool _processEnded GUARDED_BY(_lock) = false;
+  bool _finished GUARDED_BY(_lock) = false;
+  bool _stops GUARDED_BY(_lock) = false;
+  Clock::time_point _heard GUARDED_BY(_lock) = Clock::now();
 
   std::shared_ptr<platform::Thread> _thread;
 };

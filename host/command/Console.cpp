@@ -50,7 +50,7 @@ void Console::result(const std::string& text, const Json& object) {
 }
 
 void Console::writeLine(std::string line) {
-  const std::lock_guard guard(_lock);
+  const platform::Guard guard(_lock);
   replaceStatus("");
   line += '\n';
   if (_closed || writeAll(STDOUT_FILENO, line)) return;
@@ -61,13 +61,13 @@ void Console::writeLine(std::string line) {
 }
 
 void Console::say(const std::string& text) {
-  const std::lock_guard guard(_lock);
+  const platform::Guard guard(_lock);
   replaceStatus("");
   writeAll(STDERR_FILENO, "tether: " + printable(text) + "\n");
 }
 
 void Console::status(const std::string& text) {
-  const std::lock_guard guard(_lock);
+  const platform::Guard guard(_lock);
   replaceStatus(text);
 }
 

@@ -6,11 +6,11 @@
 #pragma once
 
 #include <atomic>
-#include <mutex>
 #include <string>
 #include <string_view>
 #include <thread>
 
+#include "Locks.h"
 #include "Text.h"
 #include "Wakeup.h"
 
@@ -41,7 +41,7 @@ class Console {
 
  private:
   void writeLine(std::string line);
-  void replaceStatus(const std::string& text);
+  void replaceStatus(const std::string& text) REQUIRES(_lock);
   bool writeAll(int descriptor, std::string_view text);
   bool waitFor(int descriptor);
 
@@ -50,8 +50,8 @@ class Console {
   Wakeup& _wakeup;
   const std::thread::id _thread = std::this_thread::get_id();
   std::atomic<bool> _closed{false};
-  std::mutex _lock;  // held for one line
-  std::string _shown;
+  platform::Mutex _lock;  // held for one line
+  std::string _shown GUARDED_BY(_lock);
 };
 
 }  // namespace tether::command

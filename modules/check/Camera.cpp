@@ -15,7 +15,7 @@ constexpr uint32_t kSettings[] = {kNkMAIDCapability_Sensitivity, kNkMAIDCapabili
 }  // namespace
 
 Camera::Camera(Object& module, uint32_t id, HandOver handOver)
-    : Object(module.context(), &module, id, "camera", "camera " + std::to_string(id)), handOver_(std::move(handOver)) {}
+    : Object(module.context(), &module, id, "camera", "camera " + std::to_string(id)), _handOver(std::move(handOver)) {}
 
 bool Camera::meet() {
   if (!mustAnnounce(kNkMAIDCapability_Name, {kNkMAIDCapType_String}, "Name, without which there is no camera")) {
@@ -69,43 +69,43 @@ void Camera::onEvent(uint32_t event, uint64_t data) {
 void Camera::addItem(uint32_t id) {
   Item* item = nullptr;
   {
-    const std::lock_guard guard(mutex_);
-    for (const auto& known : items_) {
+    const platform::Guard guard(_lock);
+    for (const auto& known : _items) {
       if (known->id() != id || !known->isOpen()) continue;
       return fault("AddChild announced item " + std::to_string(id) + ", which is announced and open already",
                    "every picture announced once");
     }
-    items_.push_back(std::make_unique<Item>(*this, id));
-    item = items_.back().get();
+    _items.push_back(std::make_unique<Item>(*this, id));
+    item = _items.back().get();
   }
-  ++announced_;
+  ++_announced;
   if (!item->openAll()) return;
   pairUp(*item);
-  handOver_(*item);
+  _handOver(*item);
 }
 
 void Camera::pairUp(const Item& item) {
-  const std::lock_guard guard(mutex_);
-  if (half_ != nullptr && !item.isHalf()) {
-    item.fault("it comes after " + half_->name() + ", a half of a pair, and is none itself",
+  const platform::Guard guard(_lock);
+  if (_half != nullptr && !item.isHalf()) {
+    item.fault("it comes after " + _half->name() + ", a half of a pair, and is none itself",
                "the two halves of a pair one after the other");
-    half_ = nullptr;
+    _half = nullptr;
   } else if (item.isHalf()) {
-    half_ = half_ == nullptr ? &item : nullptr;
+    _half = _half == nullptr ? &item : nullptr;
   }
 }
 
 void Camera::checkPairs() {
-  const std::lock_guard guard(mutex_);
-  if (half_ == nullptr) return;
-  half_->fault("the other half of its pair never came",
+  const platform::Guard guard(_lock);
+  if (_half == nullptr) return;
+  _half->fault("the other half of its pair never came",
                "two pictures of a pair, with RawJpegImageStatus not 0 in both");
 }
 
 std::vector<Object*> Camera::below() const {
-  const std::lock_guard guard(mutex_);
+  const platform::Guard guard(_lock);
   std::vector<Object*> all;
-  for (const auto& item : items_) all.push_back(item.get());
+  for (const auto& item : _items) all.push_back(item.get());
   return all;
 }
 
@@ -135,7 +135,7 @@ std::vector<uint32_t> Module::cameras() {
 }
 
 void Module::onEvent(uint32_t event, uint64_t /*data*/) {
-  if (event == kNkMAIDEvent_AddChild || event == kNkMAIDEvent_RemoveChild) hasNews_ = true;
+  if (event == kNkMAIDEvent_AddChild || event == kNkMAIDEvent_RemoveChild) _hasNews = true;
 }
 
 }  // namespace modulecheck

@@ -5,7 +5,6 @@
 #include <functional>
 #include <map>
 #include <memory>
-#include <mutex>
 #include <vector>
 
 #include "Picture.h"
@@ -28,7 +27,7 @@ class Camera : public Object {
   bool canCapture() const { return announces(kNkMAIDCapability_Capture); }
   // Fires the shutter. False where it was refused or failed, which is no fault of the module.
   bool capture();
-  uint32_t announced() const { return announced_; }
+  uint32_t announced() const { return _announced; }
   // At the end: no half of a pair may be left over.
   void checkPairs();
 
@@ -40,11 +39,11 @@ class Camera : public Object {
   void addItem(uint32_t id);
   void pairUp(const Item& item);
 
-  const HandOver handOver_;
-  std::atomic<uint32_t> announced_{0};
-  mutable std::mutex mutex_;
-  std::vector<std::unique_ptr<Item>> items_;
-  const Item* half_ = nullptr;  // whose other half has not come
+  const HandOver _handOver;
+  std::atomic<uint32_t> _announced{0};
+  mutable platform::Mutex _lock;
+  std::vector<std::unique_ptr<Item>> _items GUARDED_BY(_lock);
+  const Item* _half GUARDED_BY(_lock) = nullptr;  // whose other half has not come
 };
 
 class Module : public Object {
@@ -53,18 +52,18 @@ class Module : public Object {
 
   void examine();
   // Whether cameras came or went since the last time.
-  bool hasNews() { return hasNews_.exchange(false); }
+  bool hasNews() { return _hasNews.exchange(false); }
   // The cameras that are listed; those whose ids cannot be a camera's left out.
   std::vector<uint32_t> cameras();
-  void add(Object* camera) { cameras_.push_back(camera); }
+  void add(Object* camera) { _cameras.push_back(camera); }
 
  protected:
   void onEvent(uint32_t event, uint64_t data) override;
-  std::vector<Object*> below() const override { return cameras_; }
+  std::vector<Object*> below() const override { return _cameras; }
 
  private:
-  std::atomic<bool> hasNews_{false};
-  std::vector<Object*> cameras_;
+  std::atomic<bool> _hasNews{false};
+  std::vector<Object*> _cameras;
 };
 
 }  // namespace modulecheck

@@ -69,19 +69,19 @@ int32_t Object::readListOnce(uint32_t& count) {
   result = call(kNkMAIDCommand_GetCapInfo, count, kNkMAIDDataType_CapInfoPtr, records.address());
   checkRoom(records, "GetCapInfo");
   if (result == kNkMAIDResult_NoError) {
-    list_.resize(count);
-    if (count != 0) std::memcpy(list_.data(), records.as(), size);
+    _list.resize(count);
+    if (count != 0) std::memcpy(_list.data(), records.as(), size);
   }
   return result;
 }
 
 void Object::checkList() {
-  for (size_t i = 0; i < list_.size(); ++i) {
-    const uint32_t id = list_[i].id;
-    if (id == kUntouchedWord || list_[i].valueType == kUntouchedWord) {
-      fault("GetCapInfo left record " + std::to_string(i + 1) + " of " + std::to_string(list_.size()) + " as it was",
+  for (size_t i = 0; i < _list.size(); ++i) {
+    const uint32_t id = _list[i].id;
+    if (id == kUntouchedWord || _list[i].valueType == kUntouchedWord) {
+      fault("GetCapInfo left record " + std::to_string(i + 1) + " of " + std::to_string(_list.size()) + " as it was",
             "as many capabilities as GetCapCount counts, id and value type in each");
-    } else if (find(id) != &list_[i]) {
+    } else if (find(id) != &_list[i]) {
       fault("it announces " + capabilityText(id) + " twice", "every capability once");
     }
   }
@@ -100,8 +100,8 @@ void Object::checkListRoom(uint32_t count) {
 
 const tagNkMAIDCapInfo* Object::find(uint32_t capability) const {
   const auto found =
-      std::find_if(list_.begin(), list_.end(), [&](const tagNkMAIDCapInfo& info) { return info.id == capability; });
-  return found == list_.end() ? nullptr : &*found;
+      std::find_if(_list.begin(), _list.end(), [&](const tagNkMAIDCapInfo& info) { return info.id == capability; });
+  return found == _list.end() ? nullptr : &*found;
 }
 
 bool Object::mustAnnounce(uint32_t capability, std::initializer_list<uint32_t> types, const char* why) {

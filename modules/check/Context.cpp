@@ -28,25 +28,25 @@ Context::Context(Report& findings, std::chrono::milliseconds longestWait) : repo
 Context& Context::theOne() { return *theContext; }
 
 void Context::add(const Object* object) {
-  const std::lock_guard guard(mutex_);
-  objects_.insert(object);
+  const platform::Guard guard(_lock);
+  _objects.insert(object);
 }
 
 Object* Context::find(void* reference) const {
-  const std::lock_guard guard(mutex_);
-  return objects_.count(reference) == 0 ? nullptr : static_cast<Object*>(reference);
+  const platform::Guard guard(_lock);
+  return _objects.count(reference) == 0 ? nullptr : static_cast<Object*>(reference);
 }
 
 void* Context::addAction(std::shared_ptr<Action> action) {
-  const std::lock_guard guard(mutex_);
-  actions_.push_back(std::move(action));
-  return reinterpret_cast<void*>(kFirstReference + actions_.size() - 1);
+  const platform::Guard guard(_lock);
+  _actions.push_back(std::move(action));
+  return reinterpret_cast<void*>(kFirstReference + _actions.size() - 1);
 }
 
 std::shared_ptr<Action> Context::action(void* reference) const {
-  const std::lock_guard guard(mutex_);
+  const platform::Guard guard(_lock);
   const uintptr_t index = reinterpret_cast<uintptr_t>(reference) - kFirstReference;
-  return index < actions_.size() ? actions_[index] : nullptr;
+  return index < _actions.size() ? _actions[index] : nullptr;
 }
 
 bool Context::mainThreadGetsThrough() {

@@ -6,7 +6,6 @@
 #include <cstdint>
 #include <deque>
 #include <memory>
-#include <mutex>
 #include <set>
 #include <thread>
 
@@ -82,9 +81,9 @@ class Context {
   std::atomic<uint32_t> holds{0};  // odd while a callback waits on purpose: what lasts then is ours
 
  private:
-  mutable std::mutex mutex_;
-  std::set<const void*> objects_;
-  std::deque<std::shared_ptr<Action>> actions_;
+  mutable platform::Mutex _lock;
+  std::set<const void*> _objects GUARDED_BY(_lock);
+  std::deque<std::shared_ptr<Action>> _actions GUARDED_BY(_lock);
 };
 
 }  // namespace modulecheck

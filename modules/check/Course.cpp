@@ -43,12 +43,12 @@ NkMAIDEntryPoint* load(Report& report, const std::string& bundlePath) {
 // What belongs to the helper alone: the host's pipes.
 class StandardPipes {
  public:
-  StandardPipes() : input_(identity(STDIN_FILENO)), output_(identity(STDOUT_FILENO)), waiting_(waiting()) {}
+  StandardPipes() : _input(identity(STDIN_FILENO)), _output(identity(STDOUT_FILENO)), _waiting(waiting()) {}
 
   void check(Report& report) const {
-    if (identity(STDIN_FILENO) != input_ || identity(STDOUT_FILENO) != output_) {
+    if (identity(STDIN_FILENO) != _input || identity(STDOUT_FILENO) != _output) {
       report.fault("module", "module", "descriptor 0 or 1 is closed, or another file", "the host's pipes left alone");
-    } else if (waiting() != waiting_) {
+    } else if (waiting() != _waiting) {
       report.fault("module", "module", "it has read from standard input", "the host's requests left alone");
     }
   }
@@ -66,82 +66,81 @@ class StandardPipes {
     return bytes;
   }
 
-  const Identity input_;
-  const Identity output_;
-  const int waiting_;
+  const Identity _input;
+  const Identity _output;
+  const int _waiting;
 };
 
 }  // namespace
 
-Transfers::Transfers() : thread_([this] { work(); }) {}
+Transfers::Transfers() : _thread([this] { work(); }) {}
 
 void Transfers::add(std::function<void()> task) {
-  const std::lock_guard guard(mutex_);
-  if (ends_) return;
-  ++unfinished_;
-  tasks_.push(std::move(task));
-  changed_.notify_one();
+  const platform::Guard guard(_lock);
+  if (_ends) return;
+  ++_unfinished;
+  _tasks.push(std::move(task));
+  _changed.notifyOne();
 }
 
 void Transfers::stop() {
   {
-    const std::lock_guard guard(mutex_);
-    ends_ = true;
-    changed_.notify_one();
+    const platform::Guard guard(_lock);
+    _ends = true;
+    _changed.notifyOne();
   }
-  if (thread_.joinable()) thread_.join();
+  if (_thread.joinable()) _thread.join();
 }
 
 void Transfers::work() {
-  std::unique_lock guard(mutex_);
+  const platform::Guard guard(_lock);
   for (;;) {
-    changed_.wait(guard, [this] { return ends_ || !tasks_.empty(); });
-    if (ends_) return;
-    const auto task = std::move(tasks_.front());
-    tasks_.pop();
-    guard.unlock();
+    while (!_ends && _tasks.empty()) _changed.wait(_lock);
+    if (_ends) return;
+    const auto task = std::move(_tasks.front());
+    _tasks.pop();
+    const platform::Release meanwhile(_lock);
     task();
-    --unfinished_;
-    guard.lock();
+    --_unfinished;
   }
 }
 
 void Course::run(const std::string& bundlePath) {
   const StandardPipes pipes;
-  context_.entryPoint = load(context_.report, bundlePath);
-  if (context_.entryPoint != nullptr) check();
-  transfers_.stop();
-  pipes.check(context_.report);
+  _context.entryPoint = load(_context.report, bundlePath);
+  if (_context.entryPoint != nullptr) check();
+  _transfers.stop();
+  pipes.check(_context.report);
 }
 
 void Course::check() {
-  module_ = std::make_unique<Module>(context_);
-  if (!module_->open()) return;
-  module_->examine();
+  _module = std::make_unique<Module>(_context);
+  if (!_module->open()) return;
+  _module->examine();
   scan();
   idle(kSettling);
-  if (present_.empty()) module_->note("there is no camera: only the module itself was checked");
-  const auto present = present_;
+  if (_present.empty()) _module->note("there is no camera: only the module itself was checked");
+  const auto present = _present;
   for (const auto& [id, camera] : present) work(*camera);
 
   // As at a shutdown: pictures that wait for their transfer are closed without it.
-  transfers_.stop();
-  for (const auto& [id, camera] : present_) {
+  _transfers.stop();
+  for (const auto& [id, camera] : _present) {
     if (camera->canCapture()) camera->capture();
   }
   idle(kSettling);
-  for (const auto& [id, camera] : present_) camera->checkPairs();
-  module_->takeDown();
+  for (const auto& [id, camera] : _present) camera->checkPairs();
+  _module->takeDown();
   std::this_thread::sleep_for(kSettling);
 }
 
 void Course::scan() {
-  const std::vector<uint32_t> listed = module_->cameras();
+  const std::vector<uint32_t> listed = _module->cameras();
   for (const uint32_t id : listed) {
-    if (present_.count(id) == 0) meet(id);
+    if (_present.count(id) == 0) meet(id);
   }
   const std::set<uint32_t> there(listed.begin(), listed.end());
-  for (auto entry = present_.begin(); entry != present_.end();) {
+  for (auto entry = _present.begin(); entry != _present.end();) {
     Camera& camera = *entry->second;
     const bool isListed = there.count(entry->first) != 0;
     if (isListed && camera.isAlive()) {
@@ -153,20 +152,20 @@ void Course::scan() {
     } else {
       camera.note("it has gone: it was given up");
     }
-    --context_.report.shared().cameras;
-    transfers_.add([&camera] { camera.takeDown(); });
-    entry = present_.erase(entry);
+    --_context.report.shared().cameras;
+    _transfers.add([&camera] { camera.takeDown(); });
+    entry = _present.erase(entry);
   }
 }
 
 void Course::meet(uint32_t id) {
-  cameras_.push_back(std::make_unique<Camera>(
-      *module_, id, [this](Item& item) { transfers_.add([&item] { item.data()->transfer(); }); }));
-  Camera& camera = *cameras_.back();
-  module_->add(&camera);
+  _cameras.push_back(std::make_unique<Camera>(
+      *_module, id, [this](Item& item) { _transfers.add([&item] { item.data()->transfer(); }); }));
+  Camera& camera = *_cameras.back();
+  _module->add(&camera);
   if (!camera.open() || !camera.meet()) return camera.takeDown();
-  present_[id] = &camera;
-  ++context_.report.shared().cameras;
+  _present[id] = &camera;
+  ++_context.report.shared().cameras;
 }
 
 void Course::work(Camera& camera) {
@@ -174,7 +173,7 @@ void Course::work(Camera& camera) {
   camera.checkSettings();
   if (camera.canCapture()) shoot(camera, 2);
   // Pictures may come by themselves, too.
-  idleUntil([this] { return transfers_.isIdle(); }, kAsLongAsItTakes);
+  idleUntil([this] { return _transfers.isIdle(); }, kAsLongAsItTakes);
   idle(kSettling);
   findAgain(camera);
 }
@@ -183,11 +182,11 @@ void Course::work(Camera& camera) {
 void Course::shoot(Camera& camera, int times) {
   for (; times > 0; --times) {
     const uint32_t before = camera.announced();
-    context_.mainThread.calling = true;
+    _context.mainThread.calling = true;
     const bool captured = camera.capture();
-    context_.mainThread.calling = false;
+    _context.mainThread.calling = false;
     const auto came = [&] { return camera.announced() != before; };
-    if (captured && !idleUntil(came, context_.patience)) {
+    if (captured && !idleUntil(came, _context.patience)) {
       camera.fault("its Capture completed and brought no picture", "AddChild for every picture");
     }
   }
@@ -195,31 +194,31 @@ void Course::shoot(Camera& camera, int times) {
 
 // A camera that was judged gone is closed on the other thread, and opened again when it is listed.
 void Course::findAgain(Camera& camera) {
-  const auto entry = present_.find(camera.id());
-  if (entry == present_.end()) return;
+  const auto entry = _present.find(camera.id());
+  if (entry == _present.end()) return;
   camera.checkPairs();
-  present_.erase(entry);
-  transfers_.add([&camera] { camera.takeDown(); });
-  while (!transfers_.isIdle()) std::this_thread::sleep_for(kIdlePause);
-  --context_.report.shared().cameras;
+  _present.erase(entry);
+  _transfers.add([&camera] { camera.takeDown(); });
+  while (!_transfers.isIdle()) std::this_thread::sleep_for(kIdlePause);
+  --_context.report.shared().cameras;
   idle(4 * kIdlePause);
   scan();
 }
 
 bool Course::idleUntil(const Condition& condition, Clock::duration longest) {
   const auto until = Clock::now() + longest;
-  context_.mainThread.calling = true;
+  _context.mainThread.calling = true;
   bool holds = false;
   for (int turn = 0; !(holds = condition()) && Clock::now() < until; ++turn) {
-    module_->poll();
-    if (module_->hasNews()) {
+    _module->poll();
+    if (_module->hasNews()) {
       scan();
     } else if (turn % 4 == 0) {
-      for (const auto& [id, camera] : present_) camera->isAlive();
+      for (const auto& [id, camera] : _present) camera->isAlive();
     }
     std::this_thread::sleep_for(kIdlePause);
   }
-  context_.mainThread.calling = false;
+  _context.mainThread.calling = false;
   return holds;
 }
 

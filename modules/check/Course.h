@@ -2,10 +2,8 @@
 // threads.
 #pragma once
 
-#include <condition_variable>
 #include <functional>
 #include <memory>
-#include <mutex>
 #include <queue>
 #include <string>
 #include <thread>
@@ -25,24 +23,24 @@ class Transfers {
 
   // Any thread. After stop(): nothing.
   void add(std::function<void()> task);
-  bool isIdle() const { return unfinished_ == 0; }
+  bool isIdle() const { return _unfinished == 0; }
   // Ends when what is being done is done; the rest is dropped.
   void stop();
 
  private:
   void work();
 
-  std::mutex mutex_;
-  std::condition_variable changed_;
-  std::queue<std::function<void()>> tasks_;
-  bool ends_ = false;
-  std::atomic<int> unfinished_{0};
-  std::thread thread_;
+  platform::Mutex _lock;
+  platform::Condition _changed;
+  std::queue<std::function<void()>> _tasks GUARDED_BY(_lock);
+  bool _ends GUARDED_BY(_lock) = false;
+  std::atomic<int> _unfinished{0};
+  std::thread _thread;
 };
 
 class Course {
  public:
-  explicit Course(Context& context) : context_(context) {}
+  explicit Course(Context& context) : _context(context) {}
 
   // Checks the module of the bundle at that path. What there is to say is reported.
   void run(const std::string& bundlePath);
@@ -60,11 +58,11 @@ class Course {
   bool idleUntil(const Condition& condition, Clock::duration longest);
   void idle(Clock::duration time);
 
-  Context& context_;
-  std::unique_ptr<Module> module_;
-  std::vector<std::unique_ptr<Camera>> cameras_;  // those that were given up, too
-  std::map<uint32_t, Camera*> present_;
-  Transfers transfers_;
+  Context& _context;
+  std::unique_ptr<Module> _module;
+  std::vector<std::unique_ptr<Camera>> _cameras;  // those that were given up, too
+  std::map<uint32_t, Camera*> _present;
+  Transfers _transfers;
 };
 
 }  // namespace modulecheck

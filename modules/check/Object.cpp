@@ -31,66 +31,66 @@ std::string eventText(uint32_t event) {
 
 }  // namespace
 
-Room::Room(size_t size, uint8_t fill) : fill_(fill), bytes_(size + 2 * kMargin, kEdge) {
+Room::Room(size_t size, uint8_t fill) : _fill(fill), _bytes(size + 2 * kMargin, kEdge) {
   std::fill_n(as(), size, fill);
 }
 
 bool Room::isIntact() const {
   const auto isEdge = [](uint8_t byte) { return byte == kEdge; };
-  return std::all_of(bytes_.begin(), bytes_.begin() + kMargin, isEdge) &&
-         std::all_of(bytes_.end() - kMargin, bytes_.end(), isEdge);
+  return std::all_of(_bytes.begin(), _bytes.begin() + kMargin, isEdge) &&
+         std::all_of(_bytes.end() - kMargin, _bytes.end(), isEdge);
 }
 
 bool Room::isUntouchedAtTheEnd(size_t count) const {
-  return std::all_of(bytes_.end() - kMargin - static_cast<std::ptrdiff_t>(count), bytes_.end() - kMargin,
-                     [this](uint8_t byte) { return byte == fill_; });
+  return std::all_of(_bytes.end() - kMargin - static_cast<std::ptrdiff_t>(count), _bytes.end() - kMargin,
+                     [this](uint8_t byte) { return byte == _fill; });
 }
 
 Object::Object(Context& context, Object* parent, uint32_t id, std::string level, std::string name)
-    : context_(context), parent_(parent), id_(id), level_(std::move(level)), name_(std::move(name)) {
-  context_.add(this);
-  record_.as<tagNkMAIDObject>()->refClient = this;
+    : _context(context), _parent(parent), _id(id), _level(std::move(level)), _name(std::move(name)) {
+  _context.add(this);
+  _record.as<tagNkMAIDObject>()->refClient = this;
 }
 
 void Object::fault(const std::string& what, const std::string& expected) const {
-  context_.report.fault(level_, name_, what, expected);
+  _context.report.fault(_level, _name, what, expected);
 }
 
-void Object::note(const std::string& what) const { context_.report.note(level_, name_, what); }
+void Object::note(const std::string& what) const { _context.report.note(_level, _name, what); }
 
 // Calls.
 
 int32_t Object::call(uint32_t command, uint32_t parameter, uint32_t dataType, uint64_t data,
                      NkMAIDCompletionProc* completion, void* reference) {
-  ++inside_;
+  ++_inside;
   const bool mayEnter = isOpen() || command == kNkMAIDCommand_Close;
   const int32_t result =
-      mayEnter ? enter(record_.as<tagNkMAIDObject>(), command, parameter, dataType, data, completion, reference)
+      mayEnter ? enter(_record.as<tagNkMAIDObject>(), command, parameter, dataType, data, completion, reference)
                : static_cast<int32_t>(kNkMAIDResult_ZombieObject);
-  --inside_;
+  --_inside;
   return result;
 }
 
 int32_t Object::enter(tagNkMAIDObject* record, uint32_t command, uint32_t parameter, uint32_t dataType, uint64_t data,
                       NkMAIDCompletionProc* completion, void* reference) {
   const std::string what = describe(command, parameter) + (Frame::current() ? ", called from inside a callback," : "");
-  const Doing doing(context_.report.shared(), name_ + ": " + what);
+  const Doing doing(_context.report.shared(), _name + ": " + what);
   Frame frame(*this, command);
-  const uint32_t holds = context_.holds;
-  const int64_t late = context_.report.shared().late;
+  const uint32_t holds = _context.holds;
+  const int64_t late = _context.report.shared().late;
   const auto start = Clock::now();
   int32_t result = kNkMAIDResult_UnexpectedError;
   try {
-    result = context_.entryPoint(record, command, parameter, dataType, data, completion, reference);
+    result = _context.entryPoint(record, command, parameter, dataType, data, completion, reference);
   } catch (...) {
     fault("an exception left " + what, "results only, never an exception");
   }
-  const auto loaded = Clock::duration(context_.report.shared().late - late);
-  if (holds % 2 == 0 && holds == context_.holds) judgeTime(what, command, Clock::now() - start - frame.ours - loaded);
-  if (std::this_thread::get_id() == context_.mainThreadId) ++context_.mainThread.calls;
-  if (record_.as<tagNkMAIDObject>()->refClient != this || !record_.isIntact()) {
+  const auto loaded = Clock::duration(_context.report.shared().late - late);
+  if (holds % 2 == 0 && holds == _context.holds) judgeTime(what, command, Clock::now() - start - frame.ours - loaded);
+  if (std::this_thread::get_id() == _context.mainThreadId) ++_context.mainThread.calls;
+  if (_record.as<tagNkMAIDObject>()->refClient != this || !_record.isIntact()) {
     fault(what + " changed its record outside the first and the last 8 bytes", "the client reference left alone");
-    record_.as<tagNkMAIDObject>()->refClient = this;
+    _record.as<tagNkMAIDObject>()->refClient = this;
   }
   return result;
 }
@@ -109,20 +109,20 @@ void Object::checkRoom(const Room& room, const std::string& what) const {
 }
 
 bool Object::open() {
-  if (parent_ != nullptr && !parent_->isOpen()) return false;
-  auto* const parent = parent_ == nullptr ? nullptr : parent_->record_.as<tagNkMAIDObject>();
-  ++inside_;
+  if (_parent != nullptr && !_parent->isOpen()) return false;
+  auto* const parent = _parent == nullptr ? nullptr : _parent->_record.as<tagNkMAIDObject>();
+  ++_inside;
   const int32_t result =
-      enter(parent, kNkMAIDCommand_Open, id_, kNkMAIDDataType_ObjectPtr, record_.address(), nullptr, nullptr);
-  --inside_;
+      enter(parent, kNkMAIDCommand_Open, _id, kNkMAIDDataType_ObjectPtr, _record.address(), nullptr, nullptr);
+  --_inside;
   if (result != kNkMAIDResult_NoError) {
     fault("Open answered " + resultText(result), "NoError; the helper leaves it out otherwise");
     return false;
   }
-  state_ = State::kOpen;
+  _state = State::kOpen;
   if (!readList()) return false;
-  registerCallback(kNkMAIDCapability_EventProc, reinterpret_cast<void (*)()>(&eventProc), events_);
-  registerCallback(kNkMAIDCapability_DataProc, reinterpret_cast<void (*)()>(&dataProc), deliveries_);
+  registerCallback(kNkMAIDCapability_EventProc, reinterpret_cast<void (*)()>(&eventProc), _events);
+  registerCallback(kNkMAIDCapability_DataProc, reinterpret_cast<void (*)()>(&dataProc), _deliveries);
   return true;
 }
 
@@ -163,20 +163,20 @@ Object::Outcome Object::perform(uint32_t capability) {
   const auto action = std::make_shared<Action>();
   action->object = this;
   action->capability = capability;
-  action->record = record_.as<tagNkMAIDObject>();
+  action->record = _record.as<tagNkMAIDObject>();
   Outcome outcome;
   outcome.answer =
-      call(kNkMAIDCommand_CapStart, capability, kNkMAIDDataType_Null, 0, &completionProc, context_.addAction(action));
+      call(kNkMAIDCommand_CapStart, capability, kNkMAIDDataType_Null, 0, &completionProc, _context.addAction(action));
   action->refused = !isSuccess(outcome.answer);
   if (action->refused) return outcome;
 
-  uint64_t seen = progress_;
+  uint64_t seen = _progress;
   auto last = Clock::now();
   while (!action->completed && (poll() || action->completed)) {
-    if (progress_ != seen) last = Clock::now();
-    seen = progress_;
-    if (Clock::now() - last > context_.patience) {
-      fault(capabilityText(capability) + " did not go on for " + std::to_string(context_.patience / 1s) +
+    if (_progress != seen) last = Clock::now();
+    seen = _progress;
+    if (Clock::now() - last > _context.patience) {
+      fault(capabilityText(capability) + " did not go on for " + std::to_string(_context.patience / 1s) +
                 " s and has not completed",
             "one completion for every start that was not refused");
       break;
@@ -193,13 +193,13 @@ Object::Outcome Object::perform(uint32_t capability) {
 
 void Object::close() {
   State open = State::kOpen;
-  if (!state_.compare_exchange_strong(open, State::kClosed)) return;
+  if (!_state.compare_exchange_strong(open, State::kClosed)) return;
   if (!othersLeave()) {
     return fault("a call of another thread does not return as long as a callback lasts",
                  "no lock held while calling back");
   }
   const int32_t result = call(kNkMAIDCommand_Close, 0, kNkMAIDDataType_Null, 0);
-  closed_ = true;
+  _closed = true;
   if (result != kNkMAIDResult_NoError) {
     fault("Close answered " + resultText(result), "NoError to the close of what is open, with nothing open below it");
   }
@@ -212,13 +212,13 @@ bool Object::othersLeave() const {
     if (&frame->object == this) ++ofThisThread;
   }
   const auto until = Clock::now() + kCloseWait;
-  while (inside_ != ofThisThread && Clock::now() < until) std::this_thread::sleep_for(kPollPause);
-  return inside_ == ofThisThread;
+  while (_inside != ofThisThread && Clock::now() < until) std::this_thread::sleep_for(kPollPause);
+  return _inside == ofThisThread;
 }
 
 void Object::takeDown() {
-  unregisterCallback(kNkMAIDCapability_EventProc, events_);
-  unregisterCallback(kNkMAIDCapability_DataProc, deliveries_);
+  unregisterCallback(kNkMAIDCapability_EventProc, _events);
+  unregisterCallback(kNkMAIDCapability_DataProc, _deliveries);
   for (Object* const child : below()) child->takeDown();
   close();
 }
@@ -229,26 +229,26 @@ void Object::takeDown() {
 class Object::InCallback {
  public:
   InCallback(Object& object, const std::string& what)
-      : frame_(Frame::current()),
-        doing_(object.context_.report.shared(), object.name_ + ": the host's side of its " + what) {
-    if (frame_ == nullptr) {
+      : _frame(Frame::current()),
+        _doing(object._context.report.shared(), object._name + ": the host's side of its " + what) {
+    if (_frame == nullptr) {
       object.note("a callback, its " + what + ", came on a thread of the module's own");
-    } else if (frame_->command != kNkMAIDCommand_Async) {
-      object.fault("its " + what + " came inside " + commandText(frame_->command) + " of " + frame_->object.name(),
+    } else if (_frame->command != kNkMAIDCommand_Async) {
+      object.fault("its " + what + " came inside " + commandText(_frame->command) + " of " + _frame->object.name(),
                    "callbacks inside polls (Async) only");
     }
-    if (object.closed_) object.fault("its " + what + " came after its Close", "no callback once Close has returned");
+    if (object._closed) object.fault("its " + what + " came after its Close", "no callback once Close has returned");
   }
   ~InCallback() {
-    if (frame_ != nullptr) frame_->ours += Clock::now() - start_;
+    if (_frame != nullptr) _frame->ours += Clock::now() - _start;
   }
   InCallback(const InCallback&) = delete;
   InCallback& operator=(const InCallback&) = delete;
 
  private:
-  const Clock::time_point start_ = Clock::now();
-  Frame* const frame_;
-  const Doing doing_;
+  const Clock::time_point _start = Clock::now();
+  Frame* const _frame;
+  const Doing _doing;
 };
 
 void Object::eventProc(void* reference, uint32_t event, uint64_t data) {
@@ -260,7 +260,7 @@ void Object::eventProc(void* reference, uint32_t event, uint64_t data) {
     return;
   }
   const InCallback inside(*object, eventText(event));
-  if (!object->events_ && !object->closed_) {
+  if (!object->_events && !object->_closed) {
     object->fault("its " + eventText(event) + " came after EventProc was taken back", "no callback after that");
   }
   object->onEvent(event, data);
@@ -277,7 +277,7 @@ int32_t Object::dataProc(void* reference, void* info, void* data) {
     return 0;
   }
   const InCallback inside(*object, "delivery");
-  if (!object->deliveries_ && !object->closed_) {
+  if (!object->_deliveries && !object->_closed) {
     object->fault("a delivery came after DataProc was taken back", "no callback after that");
   }
   tagNkMAIDFileInfo copy{};

@@ -21,10 +21,10 @@ class Room {
 
   template <typename T = uint8_t>
   T* as() {
-    return reinterpret_cast<T*>(bytes_.data() + kMargin);
+    return reinterpret_cast<T*>(_bytes.data() + kMargin);
   }
   uint64_t address() { return reinterpret_cast<uintptr_t>(as()); }
-  size_t size() const { return bytes_.size() - 2 * kMargin; }
+  size_t size() const { return _bytes.size() - 2 * kMargin; }
   bool isIntact() const;
   // Whether the last bytes are as they were.
   bool isUntouchedAtTheEnd(size_t count) const;
@@ -35,8 +35,8 @@ class Room {
   static constexpr size_t kMargin = 256;
   static constexpr uint8_t kEdge = 0xC3;
 
-  const uint8_t fill_;
-  std::vector<uint8_t> bytes_;
+  const uint8_t _fill;
+  std::vector<uint8_t> _bytes;
 };
 
 class Object {
@@ -52,7 +52,7 @@ class Object {
   void close();
   // As an object is given up that is still open: callbacks off, then everything below it, then the close.
   void takeDown();
-  bool isOpen() const { return state_ == State::kOpen; }
+  bool isOpen() const { return _state == State::kOpen; }
 
   bool announces(uint32_t capability) const { return find(capability) != nullptr; }
   // A fault where it is missing, or of a type that the helper does not read as what it is.
@@ -79,9 +79,9 @@ class Object {
 
   void fault(const std::string& what, const std::string& expected) const;
   void note(const std::string& what) const;
-  const std::string& name() const { return name_; }
-  uint32_t id() const { return id_; }
-  Context& context() const { return context_; }
+  const std::string& name() const { return _name; }
+  uint32_t id() const { return _id; }
+  Context& context() const { return _context; }
 
  protected:
   // What the module calls back. By default nothing happens.
@@ -90,7 +90,7 @@ class Object {
   virtual void onCompletion(uint32_t capability, int32_t result);
   virtual std::vector<Object*> below() const { return {}; }
   // Something came that an action waits for.
-  void noteProgress() { ++progress_; }
+  void noteProgress() { ++_progress; }
 
  private:
   enum class State { kNew, kOpen, kClosed };
@@ -126,19 +126,19 @@ class Object {
   void checkCompletion(const Action& action, const tagNkMAIDObject* record, uint32_t command, uint32_t parameter,
                        uint32_t dataType, uint64_t data) const;
 
-  Context& context_;
-  Object* const parent_;
-  const uint32_t id_;
-  const std::string level_;
-  const std::string name_;
-  Room record_{sizeof(tagNkMAIDObject), 0};
-  std::atomic<State> state_{State::kNew};
-  std::atomic<bool> events_{false};
-  std::atomic<bool> deliveries_{false};
-  std::atomic<int> inside_{0};       // calls about this object that have not returned
-  std::atomic<bool> closed_{false};  // the module has said so
-  std::atomic<uint64_t> progress_{0};
-  std::vector<tagNkMAIDCapInfo> list_;
+  Context& _context;
+  Object* const _parent;
+  const uint32_t _id;
+  const std::string _level;
+  const std::string _name;
+  Room _record{sizeof(tagNkMAIDObject), 0};
+  std::atomic<State> _state{State::kNew};
+  std::atomic<bool> _events{false};
+  std::atomic<bool> _deliveries{false};
+  std::atomic<int> _inside{0};       // calls about this object that have not returned
+  std::atomic<bool> _closed{false};  // the module has said so
+  std::atomic<uint64_t> _progress{0};
+  std::vector<tagNkMAIDCapInfo> _list;
 };
 
 }  // namespace modulecheck

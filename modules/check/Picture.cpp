@@ -18,7 +18,7 @@ bool hasExtension(uint32_t fileDataType) {
 
 Data::Data(Item& item)
     : Object(item.context(), &item, kNkMAIDDataObjType_Image, "data object", "data object of " + item.name()),
-      item_(item) {}
+      _item(item) {}
 
 void Data::examine() {
   mustAnnounce(kNkMAIDCapability_Acquire, {kNkMAIDCapType_Process}, "Acquire, without which no picture comes");
@@ -26,21 +26,21 @@ void Data::examine() {
   for (const uint32_t capability : {kNkMAIDCapability_StoredBytes, kNkMAIDCapability_RawJpegImageStatus}) {
     if (announces(capability)) mustAnnounce(capability, kNumbers, "");
   }
-  storedBytes_ = number(kNkMAIDCapability_StoredBytes);
-  isHalf_ = number(kNkMAIDCapability_RawJpegImageStatus).value_or(0) != 0;
+  _storedBytes = number(kNkMAIDCapability_StoredBytes);
+  _isHalf = number(kNkMAIDCapability_RawJpegImageStatus).value_or(0) != 0;
   if (announces(kNkMAIDCapability_Name)) text(kNkMAIDCapability_Name, Reading::kMay);
 }
 
 void Data::transfer() {
-  if (!isOpen() || !announces(kNkMAIDCapability_Acquire)) return item_.takeDown();
-  isTransferred_ = true;
+  if (!isOpen() || !announces(kNkMAIDCapability_Acquire)) return _item.takeDown();
+  _isTransferred = true;
   const Outcome outcome = perform(kNkMAIDCapability_Acquire);
   checkWhole(outcome);
-  item_.takeDown();
+  _item.takeDown();
 }
 
 void Data::checkWhole(const Outcome& outcome) {
-  const std::lock_guard guard(mutex_);
+  const platform::Guard guard(_lock);
   if (outcome.answer != kNkMAIDResult_NoError && outcome.answer != kNkMAIDResult_Pending) {
     return fault("CapStart Acquire answered " + resultText(outcome.answer),
                  "NoError or Pending; it is not tried again, and the picture is lost");
@@ -48,8 +48,8 @@ void Data::checkWhole(const Outcome& outcome) {
   if (!outcome.result) return;
   if (*outcome.result != kNkMAIDResult_NoError) {
     fault("Acquire completed with " + resultText(*outcome.result), "NoError; it is not tried again");
-  } else if (!isWhole_) {
-    fault("Acquire completed with NoError after " + std::to_string(received_) + " of " + std::to_string(total_) +
+  } else if (!_isWhole) {
+    fault("Acquire completed with NoError after " + std::to_string(_received) + " of " + std::to_string(_total) +
               " bytes",
           "a delivery that reaches the total length before the completion");
   } else {
@@ -58,31 +58,33 @@ void Data::checkWhole(const Outcome& outcome) {
 }
 
 void Data::onDelivery(const tagNkMAIDFileInfo& info, const uint8_t* bytes) {
+  bool first = false;
   {
-    const std::lock_guard guard(mutex_);
-    if (!isTransferred_)
+    const platform::Guard guard(_lock);
+    if (!_isTransferred)
       fault("a delivery came before its Acquire was started", "deliveries of a started Acquire only");
     if ((info.dataType & kNkMAIDDataObjType_File) == 0) {
       fault("a delivery has data type " + std::to_string(info.dataType), "the file flag, 0x10; others are ignored");
       return;
     }
-    if (count_++ == 0) checkFirst(info);
+    first = _count++ == 0;
+    if (first) checkFirst(info);
     checkPlace(info);
     if (bytes == nullptr && info.ulLength != 0) {
       return fault("a delivery has no bytes", "a pointer to its bytes, good until the callback returns");
     }
-    sum_ = std::accumulate(bytes, bytes + info.ulLength, sum_.load());
+    _sum = std::accumulate(bytes, bytes + info.ulLength, _sum.load());
   }
   const bool elsewhere = std::this_thread::get_id() != context().mainThreadId;
-  if (elsewhere && count_ == 1 && !context().mainThreadGetsThrough()) {
+  if (elsewhere && first && !context().mainThreadGetsThrough()) {
     fault("another thread's call does not return as long as a callback lasts", "no lock held while calling back");
   }
 }
 
 void Data::checkFirst(const tagNkMAIDFileInfo& info) {
-  total_ = info.totalLength;
-  if (storedBytes_.value_or(0) != 0 && *storedBytes_ != total_) {
-    fault("it has " + std::to_string(*storedBytes_) + " StoredBytes and delivers " + std::to_string(total_),
+  _total = info.totalLength;
+  if (_storedBytes.value_or(0) != 0 && *_storedBytes != _total) {
+    fault("it has " + std::to_string(*_storedBytes) + " StoredBytes and delivers " + std::to_string(_total),
           "StoredBytes and the total length of deliveries alike");
   }
   if (!hasExtension(info.fileDataType)) {
@@ -91,30 +93,30 @@ void Data::checkFirst(const tagNkMAIDFileInfo& info) {
 }
 
 void Data::checkPlace(const tagNkMAIDFileInfo& info) {
-  const std::string which = "delivery " + std::to_string(count_) + " brings " + std::to_string(info.ulLength) +
+  const std::string which = "delivery " + std::to_string(_count) + " brings " + std::to_string(info.ulLength) +
                             " bytes at " + std::to_string(info.ulStart);
   const uint64_t end = uint64_t{info.ulStart} + info.ulLength;
-  if (info.totalLength != total_) {
-    fault("delivery " + std::to_string(count_) + " has a total length of " + std::to_string(info.totalLength) +
-              " after one of " + std::to_string(total_),
+  if (info.totalLength != _total) {
+    fault("delivery " + std::to_string(_count) + " has a total length of " + std::to_string(info.totalLength) +
+              " after one of " + std::to_string(_total),
           "the same total length in all deliveries of a file");
   }
-  if (isWhole_) {
+  if (_isWhole) {
     fault(which + " after the last one", "no delivery after the one that reaches the total length");
-  } else if (end > total_) {
-    fault(which + " of " + std::to_string(total_), "no byte beyond the total length");
-  } else if (info.ulStart != received_) {
-    fault(which + " after " + std::to_string(received_) + " bytes", "deliveries in file order, without gaps");
+  } else if (end > _total) {
+    fault(which + " of " + std::to_string(_total), "no byte beyond the total length");
+  } else if (info.ulStart != _received) {
+    fault(which + " after " + std::to_string(_received) + " bytes", "deliveries in file order, without gaps");
   }
-  if (end > received_) noteProgress();
-  received_ = std::max(received_, end);
-  isWhole_ = isWhole_ || end >= info.totalLength;
+  if (end > _received) noteProgress();
+  _received = std::max(_received, end);
+  _isWhole = _isWhole || end >= info.totalLength;
 }
 
 // The helper closes both from inside the completion, on whichever thread that comes.
 void Data::onCompletion(uint32_t /*capability*/, int32_t /*result*/) {
   close();
-  item_.close();
+  _item.close();
 }
 
 Item::Item(Object& camera, uint32_t id)
@@ -130,12 +132,12 @@ bool Item::openAll() {
     note("it has no image data (DataTypes " + std::to_string(*types) + "): nothing is transferred");
     return false;
   }
-  data_ = std::make_unique<Data>(*this);
-  if (!data_->open()) return false;
-  data_->examine();
+  _data = std::make_unique<Data>(*this);
+  if (!_data->open()) return false;
+  _data->examine();
   return true;
 }
 
-std::vector<Object*> Item::below() const { return data_ ? std::vector<Object*>{data_.get()} : std::vector<Object*>(); }
+std::vector<Object*> Item::below() const { return _data ? std::vector<Object*>{_data.get()} : std::vector<Object*>(); }
 
 }  // namespace modulecheck

@@ -2,7 +2,6 @@
 #pragma once
 
 #include <memory>
-#include <mutex>
 
 #include "Object.h"
 
@@ -17,7 +16,7 @@ class Data : public Object {
   // What is read before the transfer. After open().
   void examine();
   // One half of a RAW and JPEG pair.
-  bool isHalf() const { return isHalf_; }
+  bool isHalf() const { return _isHalf; }
   // Transfers the picture and closes data object and item. On the thread for transfers.
   void transfer();
 
@@ -26,21 +25,21 @@ class Data : public Object {
   void onCompletion(uint32_t capability, int32_t result) override;
 
  private:
-  void checkFirst(const tagNkMAIDFileInfo& info);
-  void checkPlace(const tagNkMAIDFileInfo& info);
+  void checkFirst(const tagNkMAIDFileInfo& info) REQUIRES(_lock);
+  void checkPlace(const tagNkMAIDFileInfo& info) REQUIRES(_lock);
   void checkWhole(const Outcome& outcome);
 
-  Item& item_;
-  std::optional<uint32_t> storedBytes_;
-  bool isHalf_ = false;
-  bool isTransferred_ = false;
+  Item& _item;
+  std::optional<uint32_t> _storedBytes;
+  bool _isHalf = false;
+  bool _isTransferred = false;
 
-  std::mutex mutex_;  // deliveries come on any thread
-  uint32_t count_ = 0;
-  uint32_t total_ = 0;
-  uint64_t received_ = 0;
-  bool isWhole_ = false;
-  std::atomic<uint32_t> sum_{0};
+  platform::Mutex _lock;  // deliveries come on any thread
+  uint32_t _count GUARDED_BY(_lock) = 0;
+  uint32_t _total GUARDED_BY(_lock) = 0;
+  uint64_t _received GUARDED_BY(_lock) = 0;
+  bool _isWhole GUARDED_BY(_lock) = false;
+  std::atomic<uint32_t> _sum{0};
 };
 
 class Item : public Object {
@@ -49,14 +48,14 @@ class Item : public Object {
 
   // Opens it with its data object, as it is done inside the event that announces it. False where there is no picture.
   bool openAll();
-  Data* data() const { return data_.get(); }
-  bool isHalf() const { return data_ && data_->isHalf(); }
+  Data* data() const { return _data.get(); }
+  bool isHalf() const { return _data && _data->isHalf(); }
 
  protected:
   std::vector<Object*> below() const override;
 
  private:
-  std::unique_ptr<Data> data_;
+  std::unique_ptr<Data> _data;
 };
 
 }  // namespace modulecheck

@@ -46,20 +46,20 @@ Shared& makeShared() {
 }
 
 bool Report::isNew(const std::string& kind) {
-  const std::lock_guard guard(mutex_);
-  return told_.insert(kind).second;
+  const platform::Guard guard(_lock);
+  return _told.insert(kind).second;
 }
 
 void Report::write(const std::string& line) const {
   const std::string whole = line + '\n';
-  while (::write(output_, whole.data(), whole.size()) < 0 && errno == EINTR) {
+  while (::write(_output, whole.data(), whole.size()) < 0 && errno == EINTR) {
   }
 }
 
 void Report::fault(const std::string& level, const std::string& object, const std::string& what,
                    const std::string& expected) {
   if (!isNew(level + withoutNumbers(what))) return;
-  ++shared_.faults;
+  ++_shared.faults;
   write(object + ": " + what + "; expected: " + expected);
 }
 
@@ -67,15 +67,15 @@ void Report::note(const std::string& level, const std::string& object, const std
   if (isNew(level + withoutNumbers(what))) write("note: " + object + ": " + what);
 }
 
-Doing::Doing(Shared& shared, const std::string& text) : activity_(activityOfThisThread(shared)) {
-  if (activity_ == nullptr) return;
-  outerSince_ = activity_->since;
-  std::memcpy(outerText_, activity_->text, sizeof outerText_);
-  set(*activity_, text, Clock::now().time_since_epoch().count());
+Doing::Doing(Shared& shared, const std::string& text) : _activity(activityOfThisThread(shared)) {
+  if (_activity == nullptr) return;
+  _outerSince = _activity->since;
+  std::memcpy(_outerText, _activity->text, sizeof _outerText);
+  set(*_activity, text, Clock::now().time_since_epoch().count());
 }
 
 Doing::~Doing() {
-  if (activity_ != nullptr) set(*activity_, outerText_, outerSince_ == 0 ? 0 : Clock::now().time_since_epoch().count());
+  if (_activity != nullptr) set(*_activity, _outerText, _outerSince == 0 ? 0 : Clock::now().time_since_epoch().count());
 }
 
 }  // namespace modulecheck

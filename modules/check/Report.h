@@ -7,9 +7,10 @@
 #include <atomic>
 #include <chrono>
 #include <cstdint>
-#include <mutex>
 #include <set>
 #include <string>
+
+#include "Locks.h"
 
 namespace modulecheck {
 
@@ -38,22 +39,22 @@ Shared& makeShared();
 class Report {
  public:
   // `output` is where lines go.
-  Report(Shared& shared, int output) : shared_(shared), output_(output) {}
+  Report(Shared& shared, int output) : _shared(shared), _output(output) {}
 
   void fault(const std::string& level, const std::string& object, const std::string& what, const std::string& expected);
   // Not against the contract, but worth knowing.
   void note(const std::string& level, const std::string& object, const std::string& what);
 
-  Shared& shared() { return shared_; }
+  Shared& shared() { return _shared; }
 
  private:
   bool isNew(const std::string& kind);
   void write(const std::string& line) const;
 
-  Shared& shared_;
-  const int output_;
-  std::mutex mutex_;
-  std::set<std::string> told_;
+  Shared& _shared;
+  const int _output;
+  platform::Mutex _lock;
+  std::set<std::string> _told GUARDED_BY(_lock);
 };
 
 // The calling thread is at something as long as it lives. They nest.
@@ -65,9 +66,9 @@ class Doing {
   Doing& operator=(const Doing&) = delete;
 
  private:
-  Activity* activity_;
-  int64_t outerSince_ = 0;
-  char outerText_[sizeof Activity::text]{};
+  Activity* _activity;
+  int64_t _outerSince = 0;
+  char _outerText[sizeof Activity::text]{};
 };
 
 }  // namespace modulecheck

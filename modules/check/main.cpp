@@ -39,31 +39,31 @@ class BundleFolder {
  public:
   explicit BundleFolder(const std::string& library) {
     const char* const temporary = std::getenv("TMPDIR");
-    root_ = std::string(temporary == nullptr ? "/tmp" : temporary) + "/check-module-XXXXXX";
-    if (mkdtemp(root_.data()) == nullptr) return;
+    _root = std::string(temporary == nullptr ? "/tmp" : temporary) + "/check-module-XXXXXX";
+    if (mkdtemp(_root.data()) == nullptr) return;
     const size_t slash = library.rfind('/');
-    bundle_ = root_ + library.substr(slash) + ".bundle";
-    folder_ = bundle_ + "/Contents/" TETHER_BUNDLE_PLATFORM;
-    mkdir(bundle_.c_str(), 0700);
-    mkdir((bundle_ + "/Contents").c_str(), 0700);
+    _bundle = _root + library.substr(slash) + ".bundle";
+    _folder = _bundle + "/Contents/" TETHER_BUNDLE_PLATFORM;
+    mkdir(_bundle.c_str(), 0700);
+    mkdir((_bundle + "/Contents").c_str(), 0700);
     // The folder, not the file: what the library looks for beside itself is there.
-    if (symlink(slash == 0 ? "/" : library.substr(0, slash).c_str(), folder_.c_str()) != 0) bundle_.clear();
+    if (symlink(slash == 0 ? "/" : library.substr(0, slash).c_str(), _folder.c_str()) != 0) _bundle.clear();
   }
   ~BundleFolder() {
-    unlink(folder_.c_str());
-    rmdir((bundle_ + "/Contents").c_str());
-    rmdir(bundle_.c_str());
-    rmdir(root_.c_str());
+    unlink(_folder.c_str());
+    rmdir((_bundle + "/Contents").c_str());
+    rmdir(_bundle.c_str());
+    rmdir(_root.c_str());
   }
   BundleFolder(const BundleFolder&) = delete;
   BundleFolder& operator=(const BundleFolder&) = delete;
 
-  const std::string& path() const { return bundle_; }
+  const std::string& path() const { return _bundle; }
 
  private:
-  std::string root_;
-  std::string bundle_;
-  std::string folder_;
+  std::string _root;
+  std::string _bundle;
+  std::string _folder;
 };
 
 struct Child {
