@@ -62,7 +62,7 @@ void setSignalMask(int how) {
 // where it is free to, may be writing to a host that does not read, or be inside a call that does not return.
 void watchForTheEnd(int signals, RunLoop& mainLoop) {
   setSignalMask(SIG_UNBLOCK);
-  std::array<pollfd, 2> watched{{{signals, POLLIN, 0}, {STDIN_FILENO, 0, 0}}};
+  std::array<pollfd, 2> watched{{{signals, POLLIN, 0}, {FileHandle::standardInput()->descriptor(), 0, 0}}};
   const auto wait = [&](std::chrono::milliseconds time) {
     for (pollfd& each : watched) each.revents = 0;
     while (poll(watched.data(), watched.size(), static_cast<int>(time.count())) < 0 && errno == EINTR) {
@@ -119,6 +119,7 @@ int applicationMain(int /*argc*/, char** /*argv*/, const std::function<std::shar
   for (const int number : {SIGPIPE, SIGXFSZ}) std::signal(number, SIG_IGN);
   std::shared_ptr<void> mainInterface;
   try {
+    FileHandle::guardStandardPipes();
     startWatching();
     mainInterface = load();
   } catch (const std::exception& exception) {

@@ -31,8 +31,8 @@ class Application {
 };
 
 // Turns the calling thread into the application's main thread: makes the main interface with `load`, keeps it, and runs
-// the main run loop until the application terminates. Ignores SIGPIPE. Returns only if
-// the interface could not be made, with a line in the log and a status other than 0, or the loop is stopped.
+// the main run loop until the application terminates. Ignores SIGPIPE. Guards the standard pipes (FileHandle). Returns
+// only if the interface could not be made, with a line in the log and a status other than 0, or the loop is stopped.
 int applicationMain(int argc, char** argv, const std::function<std::shared_ptr<void>()>& load);
 
 }  // namespace platform

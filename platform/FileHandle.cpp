@@ -1,11 +1,13 @@
 #include "FileHandle.h"
 
+#include <fcntl.h>
 #include <poll.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
+#include <system_error>
 
 #include "Log.h"
 #include "NotificationCenter.h"
@@ -17,16 +19,33 @@ constexpr std::size_t kLargestRead = 64 * 1024;
 // One write() takes no more than 2 GiB less a page on Linux, and fails above 2 GiB on macOS.
 constexpr std::size_t kLargestWrite = 1U << 30;
 
+int standardInputDescriptor = STDIN_FILENO;
+int standardOutputDescriptor = STDOUT_FILENO;
+
+int checked(int result) {
+  if (result < 0) throw std::system_error(errno, std::generic_category(), "standard pipes");
+  return result;
+}
+
 }  // namespace
 
 const std::shared_ptr<FileHandle>& FileHandle::standardInput() {
-  static const auto* const handle = new std::shared_ptr<FileHandle>(new FileHandle(STDIN_FILENO));
+  static const auto* const handle = new std::shared_ptr<FileHandle>(new FileHandle(standardInputDescriptor));
   return *handle;
 }
 
 const std::shared_ptr<FileHandle>& FileHandle::standardOutput() {
-  static const auto* const handle = new std::shared_ptr<FileHandle>(new FileHandle(STDOUT_FILENO));
+  static const auto* const handle = new std::shared_ptr<FileHandle>(new FileHandle(standardOutputDescriptor));
   return *handle;
+}
+
+void FileHandle::guardStandardPipes() {
+  standardInputDescriptor = checked(fcntl(STDIN_FILENO, F_DUPFD_CLOEXEC, STDERR_FILENO + 1));
+  standardOutputDescriptor = checked(fcntl(STDOUT_FILENO, F_DUPFD_CLOEXEC, STDERR_FILENO + 1));
+  const int nothing = checked(open("/dev/null", O_RDWR | O_CLOEXEC));
+  checked(dup2(nothing, STDIN_FILENO));
+  checked(dup2(STDERR_FILENO, STDOUT_FILENO));
+  close(nothing);
 }
 
 FileHandle::~FileHandle() {

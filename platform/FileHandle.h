@@ -14,9 +14,12 @@ namespace platform {
 
 class FileHandle {
  public:
-  // The process's own standard input and output; they live until it ends.
+  // The pipes that were the process's standard input and output when it started; they live until it ends.
   static const std::shared_ptr<FileHandle>& standardInput();
   static const std::shared_ptr<FileHandle>& standardOutput();
+  // Moves both to descriptors of their own, once, before they are used. What a library closes, reads or prints on
+  // descriptors 0 and 1 from then on is /dev/null and the standard error. Throws std::system_error.
+  static void guardStandardPipes();
 
   // Takes the descriptor over and closes it in the end.
   explicit FileHandle(int descriptor) : _descriptor(descriptor) {}

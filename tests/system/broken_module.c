@@ -27,9 +27,10 @@ static void readWrongly(uint32_t capability, void* data) {
   if (capability != kNkMAIDCapability_Aperture) return;
   if (broken("crashes")) abort();
   if (broken("exits")) _exit(3);
-  if (broken("prints")) printf("Aperture\n");
-  if (broken("reads")) getchar();
-  if (broken("closes")) close(STDIN_FILENO);
+  if (broken("prints") || broken("pipes")) printf("Aperture\n");
+  if (broken("pipes")) fflush(stdout);
+  if (broken("reads") || broken("pipes")) getchar();
+  if (broken("closes") || broken("pipes")) close(STDIN_FILENO);
 }
 
 int32_t ENTRY(tagNkMAIDObject* object, uint32_t command, uint32_t parameter, uint32_t dataType, uint64_t data,

@@ -61,6 +61,17 @@ TEST_F(Modules, TheExampleInCIsLoadedListedReadFiredAndDelivers) {
   }
 }
 
+TEST_F(Modules, ThatPrintReadAndCloseWhereTheHostsPipesWereDoNotTouchThem) {
+  helper.install("Type0005Module", BROKEN_MODULE);
+  helper.setEnvironment("BROKEN", "pipes");
+  helper.start();
+  helper.await("deviceAdded");
+  helper.send(request("connectDevice", 1, 0x0501) + request("getDeviceInfo", 2));
+  EXPECT_EQ(helper.await("cameraSettingsChanged").number("isoSpeed"), 200);
+  helper.send(request("getCameraSettings", 3, 0x0501));
+  EXPECT_EQ(helper.awaitAnswer(3).name, "ok");
+}
+
 TEST_F(Modules, ThatDoNotLoadOrOpenAreSkippedAndTheOthersWork) {
   writeExecutable("Type0002Module", "no library\n");
   helper.install("Type0003Module", MODULE_WITHOUT_ENTRY);
