@@ -1,13 +1,24 @@
 #include "NotificationCenter.h"
 
 #include <algorithm>
+#include <array>
 
 namespace platform {
+namespace {
+
+// Of one notification: for no more than these, posting takes no memory.
+constexpr std::size_t kUsualObservers = 2;
+
+}  // namespace
 
 struct Observer::Entry {
-  std::string name;
-  const void* object;
-  std::function<void(const Notification&)> handler;
+  Entry(NotificationCenter& by, std::string wanted, const void* of, std::function<void(const Notification&)> handle)
+      : center(by), name(std::move(wanted)), object(of), handler(std::move(handle)) {}
+
+  NotificationCenter& center;
+  const std::string name;
+  const void* const object;
+  const std::function<void(const Notification&)> handler;
   RecursiveMutex lock;  // held during a delivery
   bool removed GUARDED_BY(lock) = false;
 };
@@ -23,12 +34,13 @@ Observer& Observer::operator=(Observer&& other) noexcept {
 void Observer::remove() {
   if (!_entry) return;
   const auto entry = std::move(_entry);
+  entry->center.forget(entry);
   const Guard guard(entry->lock);
   entry->removed = true;
 }
 
 NotificationCenter& NotificationCenter::defaultCenter() {
-  static NotificationCenter* const center = new NotificationCenter;  // outlives every thread
+  static NotificationCenter* const center = new NotificationCenter;
   return *center;
 }
 
@@ -39,33 +51,39 @@ NotificationCenter& NotificationCenter::workspaceCenter() {
 
 Observer NotificationCenter::addObserver(std::string name, const void* object,
                                          std::function<void(const Notification&)> handler) {
-  auto entry = std::make_shared<Observer::Entry>();
-  entry->name = std::move(name);
-  entry->object = object;
-  entry->handler = std::move(handler);
+  auto entry = std::make_shared<Observer::Entry>(*this, std::move(name), object, std::move(handler));
   const Guard guard(_lock);
-  _entries.erase(std::remove_if(_entries.begin(), _entries.end(), [](const auto& weak) { return weak.expired(); }),
-                 _entries.end());
   _entries.push_back(entry);
   return Observer(std::move(entry));
 }
 
+void NotificationCenter::forget(const std::shared_ptr<Observer::Entry>& entry) {
+  const Guard guard(_lock);
+  _entries.erase(std::remove(_entries.begin(), _entries.end(), entry), _entries.end());
+}
+
 void NotificationCenter::post(const Notification& notification) {
-  std::vector<std::shared_ptr<Observer::Entry>> addressed;
+  std::array<std::shared_ptr<Observer::Entry>, kUsualObservers> addressed;
+  std::vector<std::shared_ptr<Observer::Entry>> more;
+  std::size_t count = 0;
   {
     const Guard guard(_lock);
-    for (const auto& weak : _entries) {
-      auto entry = weak.lock();
-      if (!entry) continue;
-      if (!entry->name.empty() && entry->name != notification.name) continue;
+    for (const auto& entry : _entries) {
       if (entry->object != nullptr && entry->object != notification.object) continue;
-      addressed.push_back(std::move(entry));
+      if (!entry->name.empty() && entry->name != notification.name) continue;
+      if (count < addressed.size()) {
+        addressed[count++] = entry;
+      } else {
+        more.push_back(entry);
+      }
     }
   }
-  for (const auto& entry : addressed) {
-    const Guard guard(entry->lock);
-    if (!entry->removed) entry->handler(notification);
-  }
+  const auto deliver = [&](Observer::Entry& entry) {
+    const Guard guard(entry.lock);
+    if (!entry.removed) entry.handler(notification);
+  };
+  for (std::size_t index = 0; index < count; ++index) deliver(*addressed[index]);
+  for (const auto& entry : more) deliver(*entry);
 }
 
 }  // namespace platform

@@ -35,6 +35,7 @@ class Observer {
   std::shared_ptr<Entry> _entry;
 };
 
+// Outlives its observers; these two outlive every thread.
 class NotificationCenter {
  public:
   static NotificationCenter& defaultCenter();
@@ -49,8 +50,11 @@ class NotificationCenter {
   void post(const Notification& notification);
 
  private:
+  friend class Observer;
+  void forget(const std::shared_ptr<Observer::Entry>& entry);
+
   Mutex _lock;
-  std::vector<std::weak_ptr<Observer::Entry>> _entries GUARDED_BY(_lock);
+  std::vector<std::shared_ptr<Observer::Entry>> _entries GUARDED_BY(_lock);
 };
 
 // Names.
