@@ -21,8 +21,8 @@ class Blank final : public virtualcamera::PictureSource {
  public:
   explicit Blank(std::uint64_t size) : _size(size) {}
   std::uint64_t size() const override { return _size; }
-  const std::uint8_t* piece(std::uint64_t /*offset*/, std::uint32_t length,
-                            std::vector<std::uint8_t>& /*scratch*/) const override {
+  camerakit::Piece piece(std::uint64_t /*offset*/, std::uint32_t length,
+                         std::vector<std::uint8_t>& /*scratch*/) const override {
     static const std::vector<std::uint8_t> block(std::size_t{1} << 20, 'x');
     return length <= block.size() ? block.data() : nullptr;
   }

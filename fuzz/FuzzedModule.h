@@ -23,7 +23,7 @@ class FuzzedModule {
     for (const uint32_t camera : {1, 2}) {
       _model.addCamera(camera, "Fuzzed").setTransfer({.deliveryBytes = 256U + _input.word(), .deliveriesPerPoll = 8});
       for (const uint32_t type : {1, 4}) {
-        _model.camera(camera)->shoot(virtualcamera::Picture::pattern(type + _input.byte(), _input.number()));
+        _model.camera(camera)->shoot(virtualcamera::patternPicture(type + _input.byte(), _input.number()));
       }
     }
     // What the record of an enumeration was changed to is filled, and what that of a delivery was is readable.

@@ -2,29 +2,24 @@
 #pragma once
 
 #include <chrono>
-#include <condition_variable>
 #include <cstdint>
 #include <functional>
 #include <limits>
-#include <mutex>
+#include <memory>
 #include <optional>
 #include <vector>
 
-#include "MAID.h"
+#include "Hooks.h"
+#include "Mutex.h"
+#include "Worker.h"
 
 namespace virtualcamera {
 
-enum class Level { Any, Module, Camera, Item, Data };
-
-// What a call is about. Of an Open, level and ids are those of the object to be opened; of a call with a record that
-// is not open they are Any and 0.
-struct Target {
-  Level level = Level::Any;
-  uint32_t camera = 0;  // 0 for the module
-  uint32_t item = 0;    // 0 for module and camera
-
-  bool operator==(const Target&) const = default;
-};
+using camerakit::Call;
+using camerakit::Capability;
+using camerakit::Delivery;
+using camerakit::Level;
+using camerakit::Target;
 
 // What becomes of some of a transfer's deliveries. One of them is counted as made even where it is dropped.
 struct DeliveryFault {
@@ -73,8 +68,9 @@ struct Fault {
   DeliveryFault delivery{};
 };
 
-// The faults of one model. Safe to use from any thread, also between two calls of a client.
-class FaultPlan {
+// The faults of one model, which asks it in the way of its calls. Safe to use from any thread, also between two calls
+// of a client.
+class FaultPlan : public camerakit::Hooks {
  public:
   using Id = uint64_t;
 
@@ -85,23 +81,43 @@ class FaultPlan {
   // Ends delays that calls are spending right now, and those of calls to come until a fault is added.
   void release();
 
-  // The first fault that is in effect for the call, having counted the call for all that match.
-  std::optional<Fault> hit(const Target& target, uint32_t command, uint32_t parameter);
-  // Spends the delay on the calling thread.
-  void spend(std::chrono::milliseconds delay);
+ protected:
+  // Nothing is called back on the module's thread any more.
+  void end() { _worker.end(); }
+
+  std::optional<int32_t> before(Call& call) override;
+  void after(Call& call) override;
+  int32_t read(const Call& call, const Capability& value) override;
+  void carryOut(const Call& start, const std::function<void()>& step) override;
+  std::optional<int32_t> deliver(const Delivery& delivery) override;
+  bool holdsBack(const Call& start) override;
+  void complete(const Call& start, int32_t result) override;
+  void abandoned(const Call& start, int32_t result) override;
 
  private:
   struct Entry {
     Id id;
-    Fault fault;
+    std::shared_ptr<const Fault> fault;
     uint64_t matched;
   };
+  // A completion that comes apart from its action: a second time, or after the close.
+  struct Stray {
+    Call start;
+    int32_t result;
+  };
 
-  std::mutex mutex_;
-  std::condition_variable releasing_;
-  std::vector<Entry> entries_;
-  Id lastId_ = 0;
-  bool released_ = false;
+  std::shared_ptr<const Fault> hit(const Call& call) KIT_EXCLUDES(_mutex);
+  void spend(std::chrono::milliseconds delay) KIT_EXCLUDES(_mutex);
+  void addStray(const Call& start, int32_t result) KIT_EXCLUDES(_mutex);
+  void completeStrays() KIT_EXCLUDES(_mutex);
+
+  camerakit::Mutex _mutex;
+  camerakit::Condition _releasing;
+  std::vector<Entry> _entries KIT_GUARDED_BY(_mutex);
+  Id _lastId KIT_GUARDED_BY(_mutex) = 0;
+  bool _released KIT_GUARDED_BY(_mutex) = false;
+  std::vector<Stray> _strays KIT_GUARDED_BY(_mutex);
+  Worker _worker;
 };
 
 }  // namespace virtualcamera

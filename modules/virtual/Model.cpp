@@ -1,226 +1,102 @@
-// What scripts do to a model and its cameras.
-#include "Core.h"
+// What scripts do to a model: calls are hooked and recorded around what the plan of faults does to them.
+#include "VirtualCamera.h"
 
 namespace virtualcamera {
 
-Model::Model(Options options) : core_(std::make_unique<Core>(std::move(options))) { install(core_.get()); }
+using camerakit::Guard;
 
-Model::~Model() { uninstall(core_.get()); }
+class Model::Script final : public FaultPlan {
+ public:
+  using FaultPlan::end;
 
-NkMAIDEntryPoint* Model::entryPoint() { return virtualcamera::entryPoint; }
+  std::optional<int32_t> before(Call& call) override {
+    if (const std::shared_ptr<const CallHook> function = hook(Before)) (*function)(call);
+    return FaultPlan::before(call);
+  }
+
+  void after(Call& call) override {
+    const bool polls = call.command == kNkMAIDCommand_Async;
+    if (polls && call.done && call.result == kNkMAIDResult_NoError) advanceCaptures(call.target);
+    FaultPlan::after(call);
+    if (!polls) keep(call);
+    if (const std::shared_ptr<const CallHook> function = hook(After)) (*function)(call);
+  }
+
+  enum When { Before, After };
+  void setHook(When when, CallHook function) {
+    auto shared = function ? std::make_shared<const CallHook>(std::move(function)) : nullptr;
+    const Guard guard(mutex);
+    hooks[when].swap(shared);
+  }
+
+  camerakit::Model* model = nullptr;
+  camerakit::Mutex mutex;
+  std::shared_ptr<const CallHook> hooks[2] KIT_GUARDED_BY(mutex);
+  bool recording KIT_GUARDED_BY(mutex) = false;
+  std::vector<Call> calls KIT_GUARDED_BY(mutex);
+
+ private:
+  std::shared_ptr<const CallHook> hook(When when) {
+    const Guard guard(mutex);
+    return hooks[when];
+  }
+
+  void keep(const Call& call) {
+    const Guard guard(mutex);
+    if (recording) calls.push_back(call);
+  }
+
+  void advanceCaptures(const Target& polled) {
+    if (polled.level != Level::Module && polled.level != Level::Camera) return;
+    for (const auto& camera : model->cameras())
+      if (polled.level == Level::Module || polled.camera == camera->id()) static_cast<Camera&>(*camera).polled();
+  }
+};
+
+Model::Model(Options options) : _script(std::make_unique<Script>()), _model(std::move(options), _script.get()) {
+  _script->model = &_model;
+}
+
+Model::~Model() { _script->end(); }
 
 Camera& Model::addCamera(uint32_t id, const std::string& name) {
-  removeCamera(id);
-  auto state = std::make_shared<CameraState>();
-  state->id = id;
-  state->name = name;
-  state->settings = defaultSettings();
-  auto camera = std::make_unique<Camera>(*core_, state);
-  Camera& handle = *camera;
-  const Lock lock(core_->mutex_);
-  core_->cameras_[id] = {std::move(state), std::move(camera)};
-  core_->queueEvent(core_->module_, kNkMAIDEvent_AddChild, id);
-  return handle;
+  auto camera = std::make_shared<Camera>(_model, id, name);
+  _model.plug(camera);
+  return *camera;
 }
 
-std::vector<Shot> Model::removeCamera(uint32_t id) {
-  const Lock lock(core_->mutex_);
-  return core_->removeCamera(id);
-}
-
-Camera* Model::camera(uint32_t id) {
-  const Lock lock(core_->mutex_);
-  const auto found = core_->cameras_.find(id);
-  return found != core_->cameras_.end() ? found->second.second.get() : nullptr;
-}
+Camera* Model::camera(uint32_t id) { return static_cast<Camera*>(_model.camera(id).get()); }
 
 std::vector<uint32_t> Model::cameras() const {
-  const Lock lock(core_->mutex_);
   std::vector<uint32_t> ids;
-  for (const auto& [id, camera] : core_->cameras_) ids.push_back(id);
+  for (const auto& camera : _model.cameras()) ids.push_back(camera->id());
   return ids;
 }
 
-void Model::raise(uint32_t event, uint64_t data) {
-  const Lock lock(core_->mutex_);
-  core_->queueEvent(core_->module_, event, data);
-}
+FaultPlan& Model::faults() { return *_script; }
 
-void Model::remove(uint32_t capability) {
-  const Lock lock(core_->mutex_);
-  core_->moduleWithout_.insert(capability);
-}
+void Model::beforeCall(CallHook hook) { _script->setHook(Script::Before, std::move(hook)); }
 
-FaultPlan& Model::faults() { return core_->faults_; }
-
-void Model::failCall(uint64_t k, int32_t result, Counting counting) {
-  const Lock lock(core_->mutex_);
-  core_->failingCall_ = k;
-  core_->failingResult_ = result;
-  core_->counting_ = counting;
-  core_->countedCalls_ = 0;
-}
-
-uint64_t Model::countedCalls() const {
-  const Lock lock(core_->mutex_);
-  return core_->countedCalls_;
-}
-
-void Model::beforeCall(CallHook hook) {
-  auto shared = hook ? std::make_shared<const CallHook>(std::move(hook)) : nullptr;
-  const Lock lock(core_->mutex_);
-  core_->before_.swap(shared);
-}
-
-void Model::afterCall(CallHook hook) {
-  auto shared = hook ? std::make_shared<const CallHook>(std::move(hook)) : nullptr;
-  const Lock lock(core_->mutex_);
-  core_->after_.swap(shared);
-}
+void Model::afterCall(CallHook hook) { _script->setHook(Script::After, std::move(hook)); }
 
 void Model::record(bool on) {
-  const Lock lock(core_->mutex_);
-  core_->recording_ = on;
-  if (on) core_->calls_.clear();
+  const Guard guard(_script->mutex);
+  _script->recording = on;
+  if (on) _script->calls.clear();
 }
 
 std::vector<Call> Model::calls() const {
-  const Lock lock(core_->mutex_);
-  return core_->calls_;
+  const Guard guard(_script->mutex);
+  return _script->calls;
 }
 
 std::vector<Target> Model::closed() const {
-  const Lock lock(core_->mutex_);
   std::vector<Target> targets;
-  for (const Call& call : core_->calls_) {
+  for (const Call& call : calls()) {
     const bool closed = call.result == kNkMAIDResult_NoError || call.result == kNkMAIDResult_OrphanedChildren;
     if (call.command == kNkMAIDCommand_Close && closed) targets.push_back(call.target);
   }
   return targets;
-}
-
-size_t Model::openObjects() const {
-  const Lock lock(core_->mutex_);
-  return core_->objects_.size();
-}
-
-Camera::Camera(Core& core, std::shared_ptr<CameraState> state) : core_(core), state_(std::move(state)) {}
-
-Camera::~Camera() = default;
-
-uint32_t Camera::id() const { return state_->id; }
-
-std::string Camera::name() const { return state_->name; }
-
-uint32_t Camera::shoot(Picture picture) {
-  Shot shot;
-  shot.push_back(std::move(picture));
-  return shoot(std::move(shot)).front();
-}
-
-std::vector<uint32_t> Camera::shootPair(Picture raw, Picture jpeg) {
-  Shot shot;
-  shot.push_back(std::move(raw));
-  shot.push_back(std::move(jpeg));
-  return shoot(std::move(shot));
-}
-
-std::vector<uint32_t> Camera::shoot(Shot shot) {
-  const Lock lock(core_.mutex_);
-  return core_.addItems(*state_, std::move(shot));
-}
-
-void Camera::load(Shot shot) {
-  const Lock lock(core_.mutex_);
-  state_->roll.push_back(std::move(shot));
-}
-
-void Camera::load(Picture picture) {
-  Shot shot;
-  shot.push_back(std::move(picture));
-  load(std::move(shot));
-}
-
-void Camera::setMaker(ShotMaker maker) {
-  auto shared = std::make_shared<const ShotMaker>(std::move(maker));
-  const Lock lock(core_.mutex_);
-  state_->maker.swap(shared);
-}
-
-std::vector<uint32_t> Camera::items() const {
-  const Lock lock(core_.mutex_);
-  std::vector<uint32_t> ids;
-  for (const auto& [id, item] : state_->items) ids.push_back(id);
-  return ids;
-}
-
-void Camera::removeItem(uint32_t item) {
-  const Lock lock(core_.mutex_);
-  core_.removeItem(*state_, item);
-}
-
-void Camera::set(Capability capability) {
-  const Lock lock(core_.mutex_);
-  const uint32_t id = capability.id;
-  state_->withoutCapabilities.erase(id);
-  uint32_t event = kNkMAIDEvent_CapChange;
-  const auto found = std::find_if(state_->settings.begin(), state_->settings.end(),
-                                  [id](const Capability& setting) { return setting.id == id; });
-  if (found == state_->settings.end()) {
-    state_->settings.push_back(std::move(capability));
-  } else {
-    if (found->valueType == capability.valueType) event = kNkMAIDEvent_CapChangeValueOnly;
-    *found = std::move(capability);
-  }
-  core_.queueEvent(*state_, event, id);
-}
-
-void Camera::remove(uint32_t capability) {
-  const Lock lock(core_.mutex_);
-  std::erase_if(state_->settings, [capability](const Capability& setting) { return setting.id == capability; });
-  state_->withoutCapabilities.insert(capability);
-  core_.queueEvent(*state_, kNkMAIDEvent_CapChange, capability);
-}
-
-void Camera::restore(uint32_t capability) {
-  const Lock lock(core_.mutex_);
-  if (state_->withoutCapabilities.erase(capability) != 0) core_.queueEvent(*state_, kNkMAIDEvent_CapChange, capability);
-}
-
-std::optional<Capability> Camera::get(uint32_t capability) const {
-  const Lock lock(core_.mutex_);
-  for (const Capability& setting : state_->settings)
-    if (setting.id == capability) return setting;
-  return std::nullopt;
-}
-
-void Camera::setAlive(bool alive) {
-  const Lock lock(core_.mutex_);
-  state_->alive = alive;
-}
-
-void Camera::setTransfer(const TransferOptions& options) {
-  const Lock lock(core_.mutex_);
-  state_->transfer = options;
-}
-
-void Camera::setCapture(const CaptureOptions& options) {
-  const Lock lock(core_.mutex_);
-  state_->capture = options;
-}
-
-void Camera::raise(uint32_t event, uint64_t data) {
-  const Lock lock(core_.mutex_);
-  core_.queueEvent(*state_, event, data);
-}
-
-void Camera::raise(uint32_t item, Level level, uint32_t event, uint64_t data) {
-  const Lock lock(core_.mutex_);
-  for (const auto& [handle, object] : core_.objects_) {
-    if (object->camera != state_ || object->target.item != item || object->target.level != level) continue;
-    core_.queueEvent(level == Level::Data ? object->item->data : *object->item, event, data);
-    return;
-  }
 }
 
 }  // namespace virtualcamera

@@ -1,56 +1,60 @@
 // The module's own thread, for faults that call back from another thread than the polling one. Internal.
 #pragma once
 
-#include <condition_variable>
 #include <deque>
 #include <functional>
-#include <mutex>
 #include <thread>
+
+#include "Mutex.h"
 
 namespace virtualcamera {
 
-// Runs jobs one after another, in the order they were posted. The thread starts with the first job; the destructor
-// drops what has not begun and waits for the job in progress.
+// Runs jobs one after another, in the order they were posted. The thread starts with the first job.
 class Worker {
  public:
   Worker() = default;
-  ~Worker() {
-    {
-      const std::lock_guard lock(mutex_);
-      ending_ = true;
-    }
-    posted_.notify_all();
-    if (thread_.joinable()) thread_.join();
-  }
+  ~Worker() { end(); }
   Worker(const Worker&) = delete;
   Worker& operator=(const Worker&) = delete;
 
   void post(std::function<void()> job) {
-    const std::lock_guard lock(mutex_);
-    jobs_.push_back(std::move(job));
-    if (!thread_.joinable()) thread_ = std::thread([this] { run(); });
-    posted_.notify_all();
+    const camerakit::Guard guard(_mutex);
+    if (_ending) return;
+    _jobs.push_back(std::move(job));
+    if (!_thread.joinable()) _thread = std::thread([this] { run(); });
+    _posted.notifyAll();
+  }
+
+  // Drops what has not begun, and what is posted from now on, and waits for the job in progress.
+  void end() {
+    std::deque<std::function<void()>> dropped;
+    {
+      const camerakit::Guard guard(_mutex);
+      _ending = true;
+      dropped.swap(_jobs);
+    }
+    _posted.notifyAll();
+    if (_thread.joinable()) _thread.join();
   }
 
  private:
   void run() {
-    std::unique_lock lock(mutex_);
+    const camerakit::Guard guard(_mutex);
     for (;;) {
-      posted_.wait(lock, [this] { return ending_ || !jobs_.empty(); });
-      if (ending_) return;
-      const std::function<void()> job = std::move(jobs_.front());
-      jobs_.pop_front();
-      lock.unlock();
+      while (!_ending && _jobs.empty()) _posted.wait(_mutex);
+      if (_ending) return;
+      const std::function<void()> job = std::move(_jobs.front());
+      _jobs.pop_front();
+      const camerakit::Release release(_mutex);
       job();
-      lock.lock();
     }
   }
 
-  std::mutex mutex_;
-  std::condition_variable posted_;
-  std::deque<std::function<void()>> jobs_;
-  bool ending_ = false;
-  std::thread thread_;
+  camerakit::Mutex _mutex;
+  camerakit::Condition _posted;
+  std::deque<std::function<void()>> _jobs KIT_GUARDED_BY(_mutex);
+  bool _ending KIT_GUARDED_BY(_mutex) = false;
+  std::thread _thread;  // started under the mutex, joined by whoever ends it
 };
 
 }  // namespace virtualcamera

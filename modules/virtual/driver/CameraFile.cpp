@@ -30,14 +30,14 @@ T number(const Json& json, const std::string& what) {
 // An object whose keys are all asked for: what is left over is unknown.
 class Reader {
  public:
-  Reader(const Json& json, std::string what) : json_(json), what_(std::move(what)) {
-    if (!json.is_object()) fail(what_ + " is not an object");
+  Reader(const Json& json, std::string what) : _json(json), _what(std::move(what)) {
+    if (!json.is_object()) fail(_what + " is not an object");
   }
 
   const Json* find(const char* key) {
-    known_.emplace_back(key);
-    const auto found = json_.find(key);
-    return found != json_.end() ? &*found : nullptr;
+    _known.emplace_back(key);
+    const auto found = _json.find(key);
+    return found != _json.end() ? &*found : nullptr;
   }
   void read(const char* key, bool& value) {
     const Json* json = find(key);
@@ -66,16 +66,16 @@ class Reader {
       fail(label(key) + ": unknown name \"" + json->get<std::string>() + "\"");
     }
   }
-  std::string label(const std::string& key) const { return what_ + " \"" + key + "\""; }
+  std::string label(const std::string& key) const { return _what + " \"" + key + "\""; }
   void end() const {
-    for (const auto& [key, value] : json_.items())
-      if (std::find(known_.begin(), known_.end(), key) == known_.end()) fail(what_ + ": unknown key \"" + key + "\"");
+    for (const auto& [key, value] : _json.items())
+      if (std::find(_known.begin(), _known.end(), key) == _known.end()) fail(_what + ": unknown key \"" + key + "\"");
   }
 
  private:
-  const Json& json_;
-  std::string what_;
-  std::vector<std::string> known_;
+  const Json& _json;
+  std::string _what;
+  std::vector<std::string> _known;
 };
 
 uint32_t capabilityFromKey(const std::string& key) {

@@ -3,10 +3,10 @@
 
 #include <cstddef>
 #include <map>
-#include <mutex>
 #include <utility>
 
 #include "FolderEvents.h"
+#include "Mutex.h"
 
 namespace virtualcamera {
 namespace {
@@ -22,38 +22,38 @@ constexpr std::pair<uint32_t, FolderEvent::What> kMeanings[] = {
 
 class Inotify final : public FolderEvents {
  public:
-  explicit Inotify(int descriptor) : descriptor_(descriptor) {}
-  ~Inotify() override { close(descriptor_); }
+  explicit Inotify(int descriptor) : _descriptor(descriptor) {}
+  ~Inotify() override { close(_descriptor); }
 
   int watch(const std::string& path) override {
     uint32_t wanted = IN_ONLYDIR;
     for (const auto& [bit, what] : kMeanings) wanted |= bit;
-    const std::lock_guard lock(mutex_);
-    const int watch = inotify_add_watch(descriptor_, path.c_str(), wanted);
+    const camerakit::Guard guard(_mutex);
+    const int watch = inotify_add_watch(_descriptor, path.c_str(), wanted);
     // A folder that is watched under another name has the same number: its events are the other's.
-    return watch >= 0 && happened_.try_emplace(watch).second ? watch : -1;
+    return watch >= 0 && _happened.try_emplace(watch).second ? watch : -1;
   }
 
   void unwatch(int watch) override {
     if (watch < 0) return;
-    const std::lock_guard lock(mutex_);
-    happened_.erase(watch);
-    inotify_rm_watch(descriptor_, watch);
+    const camerakit::Guard guard(_mutex);
+    _happened.erase(watch);
+    inotify_rm_watch(_descriptor, watch);
   }
 
   std::optional<std::vector<FolderEvent>> take(int watch) override {
-    const std::lock_guard lock(mutex_);
+    const camerakit::Guard guard(_mutex);
     readEvents();
-    const auto found = happened_.find(watch);
-    if (found == happened_.end()) return std::nullopt;
+    const auto found = _happened.find(watch);
+    if (found == _happened.end()) return std::nullopt;
     return std::exchange(found->second, {});
   }
 
  private:
-  void readEvents() {
+  void readEvents() KIT_REQUIRES(_mutex) {
     alignas(inotify_event) char bytes[kReadBytes];
     for (ssize_t got = kReadBytes; got + kLongestEvent > kReadBytes;) {
-      got = read(descriptor_, bytes, sizeof bytes);
+      got = read(_descriptor, bytes, sizeof bytes);
       if (got <= 0) return;
       for (ssize_t at = 0; at < got;) {
         const auto* const event = reinterpret_cast<const inotify_event*>(bytes + at);
@@ -63,21 +63,22 @@ class Inotify final : public FolderEvents {
     }
   }
 
-  void note(const inotify_event& event, const char* name) {
-    if (event.mask & IN_Q_OVERFLOW) return happened_.clear();
-    const auto found = happened_.find(event.wd);
-    if (found == happened_.end()) return;
+  void note(const inotify_event& event, const char* name) KIT_REQUIRES(_mutex) {
+    if (event.mask & IN_Q_OVERFLOW) return _happened.clear();
+    const auto found = _happened.find(event.wd);
+    if (found == _happened.end()) return;
     if (event.mask & IN_IGNORED) {
-      happened_.erase(found);
+      _happened.erase(found);
       return;
     }
     for (const auto& [bit, what] : kMeanings)
       if (event.mask & bit) found->second.push_back({what, name});
   }
 
-  const int descriptor_;
-  std::mutex mutex_;
-  std::map<int, std::vector<FolderEvent>> happened_;  // by the number of the watch
+  const int _descriptor;
+  camerakit::Mutex _mutex;
+  // By the number of the watch.
+  std::map<int, std::vector<FolderEvent>> _happened KIT_GUARDED_BY(_mutex);
 };
 
 }  // namespace

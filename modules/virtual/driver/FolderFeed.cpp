@@ -14,6 +14,9 @@
 #include "OwnPicture.h"
 
 namespace virtualcamera {
+
+using camerakit::Guard;
+
 namespace {
 
 constexpr std::chrono::milliseconds kLookInterval{50};
@@ -86,158 +89,156 @@ const Capability* find(const std::vector<Capability>& settings, uint32_t id) {
 }  // namespace
 
 void Shutter::setName(const std::string& name) {
-  const std::lock_guard lock(mutex_);
-  name_ = name;
+  const Guard guard(_mutex);
+  _name = name;
 }
 
 void Shutter::configure(const FileTypes& types, bool pairs) {
-  const std::lock_guard lock(mutex_);
-  roll_.configure(types, false);
-  pairs_ = pairs;
+  const Guard guard(_mutex);
+  _roll.configure(types, false);
+  _pairs = pairs;
 }
 
 void Shutter::look() {
-  const std::lock_guard lock(mutex_);
-  roll_.look();
+  const Guard guard(_mutex);
+  _roll.look();
 }
 
 void Shutter::leave() {
-  const std::lock_guard lock(mutex_);
-  roll_.leave();
+  const Guard guard(_mutex);
+  _roll.leave();
 }
 
 Shot Shutter::take(uint32_t number) {
-  const std::lock_guard lock(mutex_);
-  roll_.look(true);
-  if (std::vector<Shot> shots = roll_.take(1); !shots.empty()) return std::move(shots.front());
-  return ownShot(number, name_, pairs_);
+  const Guard guard(_mutex);
+  _roll.look(true);
+  if (std::vector<Shot> shots = _roll.take(1); !shots.empty()) return std::move(shots.front());
+  return ownShot(number, _name, _pairs);
 }
 
 CameraFolder::CameraFolder(Model& model, const FeedOptions& options, uint32_t id, std::string name,
                            const std::string& path)
-    : model_(model),
-      id_(id),
-      name_(std::move(name)),
-      path_(path),
-      filePath_(path + "/camera.json"),
-      shutter_(std::make_shared<Shutter>(path + "/roll", options.events)),
-      pictures_(path, options.events, options.rest, PictureFolder::First::Known) {}
+    : _model(model),
+      _id(id),
+      _name(std::move(name)),
+      _path(path),
+      _filePath(path + "/camera.json"),
+      _shutter(std::make_shared<Shutter>(path + "/roll", options.events)),
+      _pictures(path, options.events, options.rest, PictureFolder::First::Known) {}
 
 CameraFolder::~CameraFolder() { unplug(); }
 
 void CameraFolder::plugIn() {
-  if (plugged_) return;
-  plugged_ = true;
+  if (_plugged) return;
+  _plugged = true;
   const CameraFile file = readFile().value_or(CameraFile{});
-  const std::string shown = file.name.value_or(name_);
-  Camera& camera = model_.addCamera(id_, shown);
-  shutter_->setName(shown);
-  camera.setMaker([shutter = shutter_](uint32_t number) { return shutter->take(number); });
-  file_ = {};
+  const std::string shown = file.name.value_or(_name);
+  Camera& camera = _model.addCamera(_id, shown);
+  _shutter->setName(shown);
+  camera.setMaker([shutter = _shutter](uint32_t number) { return shutter->take(number); });
+  _file = {};
   apply(file);
-  for (Shot& shot : left_) {
+  for (Shot& shot : _left) {
     // What has been removed or changed; but not all of it, where the folder is just being moved away again.
-    std::erase_if(shot, [this](const Picture& picture) { return !picture.source->isThere() && isFolder(path_); });
+    std::erase_if(shot, [this](const Picture& picture) { return !isThere(picture) && isFolder(_path); });
     if (!shot.empty()) camera.shoot(std::move(shot));
   }
-  left_.clear();
+  _left.clear();
 }
 
 void CameraFolder::unplug() {
-  if (!plugged_) return;
-  plugged_ = false;
-  for (const FaultPlan::Id fault : faults_) model_.faults().remove(fault);
-  faults_.clear();
-  left_ = model_.removeCamera(id_);
-  for (const Shot& shot : left_)
-    for (const Picture& picture : shot) picture.source->rest();
-  pictures_.leave();
-  shutter_->leave();
+  if (!_plugged) return;
+  _plugged = false;
+  for (const FaultPlan::Id fault : _faults) _model.faults().remove(fault);
+  _faults.clear();
+  _left = _model.removeCamera(_id);
+  _pictures.leave();
+  _shutter->leave();
 }
 
 void CameraFolder::look() {
-  if (!plugged_) return;
-  pictures_.look();
-  if (pictures_.wasAway()) return unplug();
-  shutter_->look();
+  if (!_plugged) return;
+  _pictures.look();
+  if (_pictures.wasAway()) return unplug();
+  _shutter->look();
   if (fileChanged())
     if (std::optional<CameraFile> file = readFile()) apply(std::move(*file));
-  Camera* camera = model_.camera(id_);
-  for (Shot& shot : pictures_.take(SIZE_MAX)) camera->shoot(std::move(shot));
+  Camera* camera = _model.camera(_id);
+  for (Shot& shot : _pictures.take(SIZE_MAX)) camera->shoot(std::move(shot));
 }
 
-bool CameraFolder::fileChanged() const { return !(stateOf(filePath_) == fileState_); }
+bool CameraFolder::fileChanged() const { return !(stateOf(_filePath) == _fileState); }
 
 // Nothing where the file has an error; no file is the same as one that says nothing.
 std::optional<CameraFile> CameraFolder::readFile() {
-  fileState_ = stateOf(filePath_);
+  _fileState = stateOf(_filePath);
   try {
-    const std::optional<std::string> text = textOf(filePath_);
-    return text ? parseCameraFile(*text, id_) : CameraFile{};
+    const std::optional<std::string> text = textOf(_filePath);
+    return text ? parseCameraFile(*text, _id) : CameraFile{};
   } catch (const std::exception& error) {
-    complain(filePath_, error.what());
+    complain(_filePath, error.what());
     return std::nullopt;
   }
 }
 
 void CameraFolder::apply(CameraFile file) {
-  Camera& camera = *model_.camera(id_);
+  Camera& camera = *_model.camera(_id);
   camera.setAlive(file.alive);
   camera.setTransfer(file.transfer);
   camera.setCapture(file.capture);
   applySettings(camera, file);
-  for (const FaultPlan::Id fault : faults_) model_.faults().remove(fault);
-  faults_.clear();
-  for (const Fault& fault : file.faults) faults_.push_back(model_.faults().add(fault));
+  for (const FaultPlan::Id fault : _faults) _model.faults().remove(fault);
+  _faults.clear();
+  for (const Fault& fault : file.faults) _faults.push_back(_model.faults().add(fault));
   FileTypes types;
   types.further = file.fileTypes;
-  shutter_->configure(types, file.pairs);
-  pictures_.configure(std::move(types), file.pairs);
-  file_ = std::move(file);
+  _shutter->configure(types, file.pairs);
+  _pictures.configure(std::move(types), file.pairs);
+  _file = std::move(file);
 }
 
 // Only what differs from before: what a client has set since stays, and only true changes raise events.
 void CameraFolder::applySettings(Camera& camera, const CameraFile& file) {
   for (const Capability& setting : file.settings) {
-    const Capability* before = find(file_.settings, setting.id);
+    const Capability* before = find(_file.settings, setting.id);
     if (before == nullptr || !(*before == setting)) camera.set(setting);
   }
-  for (const Capability& before : file_.settings)
+  for (const Capability& before : _file.settings)
     if (find(file.settings, before.id) == nullptr) camera.remove(before.id);
   for (const uint32_t id : file.withoutCapabilities)
-    if (find(file_.settings, id) == nullptr) camera.remove(id);
-  for (const uint32_t id : file_.withoutCapabilities)
+    if (find(_file.settings, id) == nullptr) camera.remove(id);
+  for (const uint32_t id : _file.withoutCapabilities)
     if (std::find(file.withoutCapabilities.begin(), file.withoutCapabilities.end(), id) ==
         file.withoutCapabilities.end())
       camera.restore(id);
 }
 
 FolderFeed::FolderFeed(Model& model, std::string folder, FeedOptions options)
-    : model_(model), options_(std::move(options)), watch_(std::move(folder)) {
-  if (!isFolder(watch_.path())) complain(watch_.path(), "is not a folder");
+    : _model(model), _options(std::move(options)), _watch(std::move(folder)) {
+  if (!isFolder(_watch.path())) complain(_watch.path(), "is not a folder");
 }
 
 void FolderFeed::look() {
-  const std::unique_lock lock(mutex_, std::try_to_lock);
-  if (!lock) return;
+  if (!_mutex.tryLock()) return;
+  const Guard guard(_mutex, camerakit::Adopt());
   const Clock::time_point now = Clock::now();
-  if (now < nextLook_) return;
-  nextLook_ = now + kLookInterval;
+  if (now < _nextLook) return;
+  _nextLook = now + kLookInterval;
   try {
-    if (watch_.changed()) listCameras();
-    for (const auto& [folder, camera] : cameras_) {
+    if (_watch.changed()) listCameras();
+    for (const auto& [folder, camera] : _cameras) {
       if (!camera->isPlugged()) continue;
       camera->look();
-      if (!camera->isPlugged()) watch_.retry();
+      if (!camera->isPlugged()) _watch.retry();
     }
   } catch (const std::exception& error) {  // out of memory, chiefly; the next look tries again
-    complain(watch_.path(), error.what());
+    complain(_watch.path(), error.what());
   }
 }
 
 void FolderFeed::listCameras() {
-  const std::optional<std::vector<FolderEntry>> entries = entriesOf(watch_.path());
-  if (!entries && isFolder(watch_.path())) return watch_.retry();
+  const std::optional<std::vector<FolderEntry>> entries = entriesOf(_watch.path());
+  if (!entries && isFolder(_watch.path())) return _watch.retry();
   std::map<std::string, CameraName> listed;
   std::set<uint32_t> ids;
   for (const auto& [folder, status] : entries.value_or(std::vector<FolderEntry>())) {
@@ -245,17 +246,17 @@ void FolderFeed::listCameras() {
     if (name && S_ISDIR(status.st_mode) && ids.insert(name->id).second) listed.emplace(folder, *name);
   }
   bool unplugged = false;
-  for (const auto& [folder, camera] : cameras_) {
+  for (const auto& [folder, camera] : _cameras) {
     if (listed.contains(folder) || !camera->isPlugged()) continue;
     camera->unplug();
     unplugged = true;
   }
   // Nobody pulls one cable and puts the next one in at the same moment; a client may not expect it either.
-  if (unplugged) return watch_.retry();
+  if (unplugged) return _watch.retry();
   for (const auto& [folder, name] : listed) {
-    std::unique_ptr<CameraFolder>& camera = cameras_[folder];
+    std::unique_ptr<CameraFolder>& camera = _cameras[folder];
     if (!camera)
-      camera = std::make_unique<CameraFolder>(model_, options_, name.id, name.name, watch_.path() + "/" + folder);
+      camera = std::make_unique<CameraFolder>(_model, _options, name.id, name.name, _watch.path() + "/" + folder);
     camera->plugIn();
   }
 }

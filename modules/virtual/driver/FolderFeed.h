@@ -24,12 +24,12 @@
 #include <chrono>
 #include <map>
 #include <memory>
-#include <mutex>
 #include <string>
 
 #include "CameraFile.h"
 #include "FileState.h"
 #include "FolderEvents.h"
+#include "Mutex.h"
 #include "PictureFolder.h"
 #include "VirtualCamera.h"
 
@@ -45,7 +45,7 @@ struct FeedOptions {
 class Shutter {
  public:
   Shutter(const std::string& rollFolder, std::shared_ptr<FolderEvents> events)
-      : roll_(rollFolder, std::move(events), std::chrono::milliseconds(0), PictureFolder::First::New) {}
+      : _roll(rollFolder, std::move(events), std::chrono::milliseconds(0), PictureFolder::First::New) {}
 
   void setName(const std::string& name);
   void configure(const FileTypes& types, bool pairs);
@@ -54,10 +54,10 @@ class Shutter {
   Shot take(uint32_t number);
 
  private:
-  std::mutex mutex_;
-  PictureFolder roll_;
-  std::string name_;
-  bool pairs_ = false;
+  camerakit::Mutex _mutex;
+  PictureFolder _roll KIT_GUARDED_BY(_mutex);
+  std::string _name KIT_GUARDED_BY(_mutex);
+  bool _pairs KIT_GUARDED_BY(_mutex) = false;
 };
 
 // One camera of the feed, which is kept while it is unplugged.
@@ -68,7 +68,7 @@ class CameraFolder {
   CameraFolder(const CameraFolder&) = delete;
   CameraFolder& operator=(const CameraFolder&) = delete;
 
-  bool isPlugged() const { return plugged_; }
+  bool isPlugged() const { return _plugged; }
   void plugIn();
   void unplug();
   void look();
@@ -79,18 +79,18 @@ class CameraFolder {
   void apply(CameraFile file);
   void applySettings(Camera& camera, const CameraFile& file);
 
-  Model& model_;
-  uint32_t id_;
-  std::string name_;
-  std::string path_;
-  std::string filePath_;
-  FileState fileState_{};
-  CameraFile file_;
-  std::vector<FaultPlan::Id> faults_;
-  std::shared_ptr<Shutter> shutter_;
-  PictureFolder pictures_;
-  std::vector<Shot> left_;  // on the camera when it was unplugged
-  bool plugged_ = false;
+  Model& _model;
+  uint32_t _id;
+  std::string _name;
+  std::string _path;
+  std::string _filePath;
+  FileState _fileState{};
+  CameraFile _file;
+  std::vector<FaultPlan::Id> _faults;
+  std::shared_ptr<Shutter> _shutter;
+  PictureFolder _pictures;
+  std::vector<Shot> _left;  // on the camera when it was unplugged
+  bool _plugged = false;
 };
 
 // The model outlives it.
@@ -104,14 +104,15 @@ class FolderFeed {
  private:
   using Clock = std::chrono::steady_clock;
 
-  void listCameras();
+  void listCameras() KIT_REQUIRES(_mutex);
 
-  Model& model_;
-  FeedOptions options_;
-  std::mutex mutex_;
-  Clock::time_point nextLook_{};
-  FolderWatch watch_;
-  std::map<std::string, std::unique_ptr<CameraFolder>> cameras_;  // by the folder's name
+  Model& _model;
+  FeedOptions _options;
+  camerakit::Mutex _mutex;
+  Clock::time_point _nextLook KIT_GUARDED_BY(_mutex){};
+  FolderWatch _watch KIT_GUARDED_BY(_mutex);
+  // By the folder's name.
+  std::map<std::string, std::unique_ptr<CameraFolder>> _cameras KIT_GUARDED_BY(_mutex);
 };
 
 }  // namespace virtualcamera

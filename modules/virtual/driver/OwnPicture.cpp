@@ -19,7 +19,7 @@ constexpr int kQuality = 85;
 
 class Image {
  public:
-  explicit Image(uint32_t number) : rgb_(size_t{kWidth} * kHeight * 3) {
+  explicit Image(uint32_t number) : _rgb(size_t{kWidth} * kHeight * 3) {
     for (int y = 0; y < kHeight; ++y)
       for (int x = 0; x < kWidth; ++x)
         set(x, y, static_cast<uint8_t>(40 + x * 100 / kWidth), static_cast<uint8_t>(50 + y * 90 / kHeight),
@@ -37,7 +37,7 @@ class Image {
     }
   }
 
-  uint8_t* row(int y) { return rgb_.data() + size_t{kWidth} * 3 * static_cast<size_t>(y); }
+  uint8_t* row(int y) { return _rgb.data() + size_t{kWidth} * 3 * static_cast<size_t>(y); }
 
  private:
   void set(int x, int y, uint8_t red, uint8_t green, uint8_t blue) {
@@ -51,7 +51,7 @@ class Image {
       for (int x = left; x < left + size && x < kWidth; ++x) set(x, y, 255, 255, 255);
   }
 
-  std::vector<uint8_t> rgb_;
+  std::vector<uint8_t> _rgb;
 };
 
 // What the encoder leaves, also when it gives up in the middle.

@@ -49,13 +49,13 @@ std::optional<uint32_t> FileTypes::of(const std::string& name) const {
 
 bool FolderWatch::changed() {
   struct stat status {};
-  if (stat(path_.c_str(), &status) != 0) return std::exchange(exists_, false);
+  if (stat(_path.c_str(), &status) != 0) return std::exchange(_exists, false);
   const int64_t modified = modificationTime(status);
   const auto now = std::chrono::steady_clock::now();
-  if (exists_ && modified == modified_) return now - since_ < kCoarsestTimeStamp;
-  exists_ = true;
-  modified_ = modified;
-  since_ = now;
+  if (_exists && modified == _modified) return now - _since < kCoarsestTimeStamp;
+  _exists = true;
+  _modified = modified;
+  _since = now;
   return true;
 }
 
@@ -73,38 +73,38 @@ std::optional<std::vector<FolderEntry>> entriesOf(const std::string& path) {
 }
 
 void PictureFolder::configure(FileTypes types, bool pairsExpected) {
-  types_ = std::move(types);
-  pairsExpected_ = pairsExpected;
+  _types = std::move(types);
+  _pairsExpected = pairsExpected;
 }
 
 void PictureFolder::leave() {
-  events_->unwatch(watch_);
-  watch_ = -1;
-  nextListing_ = {};
-  away_ = false;
-  for (auto& [name, file] : files_) file.writer = File::Unknown;
+  _events->unwatch(_watch);
+  _watch = -1;
+  _nextListing = {};
+  _away = false;
+  for (auto& [name, file] : _files) file.writer = File::Unknown;
 }
 
 // What there is.
 
 void PictureFolder::look(bool now) {
-  const std::optional<std::vector<FolderEvent>> events = events_->take(watch_);
+  const std::optional<std::vector<FolderEvent>> events = _events->take(_watch);
   if (events) apply(*events);
   struct stat status {};
-  if (stat(path_.c_str(), &status) != 0 || !S_ISDIR(status.st_mode)) {
+  if (stat(_path.c_str(), &status) != 0 || !S_ISDIR(status.st_mode)) {
     leave();
-    away_ = true;
+    _away = true;
     return;
   }
-  const bool sameFolder = events && status.st_ino == inode_;
+  const bool sameFolder = events && status.st_ino == _inode;
   // The system may tell nothing of what another computer does in a shared folder.
-  const bool untold = sameFolder && events->empty() && modificationTime(status) != modified_;
-  modified_ = modificationTime(status);
+  const bool untold = sameFolder && events->empty() && modificationTime(status) != _modified;
+  _modified = modificationTime(status);
   if (sameFolder) return untold ? list() : void();
-  if (watch_ < 0 && !now && Clock::now() < nextListing_) return;
-  inode_ = status.st_ino;
+  if (_watch < 0 && !now && Clock::now() < _nextListing) return;
+  _inode = status.st_ino;
   leave();
-  watch_ = events_->watch(path_);
+  _watch = _events->watch(_path);
   list();
 }
 
@@ -112,19 +112,19 @@ void PictureFolder::look(bool now) {
 // between.
 void PictureFolder::list() {
   const auto start = Clock::now();
-  if (const std::optional<std::vector<FolderEntry>> entries = entriesOf(path_)) {
+  if (const std::optional<std::vector<FolderEntry>> entries = entriesOf(_path)) {
     know(*entries);
   } else {
     leave();
   }
   const auto end = Clock::now();
-  nextListing_ = end + std::max<Clock::duration>(kListingInterval, kListingShare * (end - start));
-  if (const auto events = events_->take(watch_)) apply(*events);
+  _nextListing = end + std::max<Clock::duration>(kListingInterval, kListingShare * (end - start));
+  if (const auto events = _events->take(_watch)) apply(*events);
 }
 
 void PictureFolder::know(const std::vector<FolderEntry>& entries) {
   Files before;
-  before.swap(files_);
+  before.swap(_files);
   for (const auto& [name, status] : entries) {
     File file;
     if (!see(file, FileState::of(status))) continue;
@@ -133,22 +133,22 @@ void PictureFolder::know(const std::vector<FolderEntry>& entries) {
       known->second.seen = file.seen;
       file = known->second;
       before.erase(known);
-    } else if (!listed_) {
-      first_ == First::New ? becomeWhole(file) : void(file.state = File::Known);
+    } else if (!_listed) {
+      _first == First::New ? becomeWhole(file) : void(file.state = File::Known);
     }
-    files_.emplace(name, file);
+    _files.emplace(name, file);
   }
   Gone gone;
   while (!before.empty()) forget(before, before.begin(), gone);
-  for (auto& [name, file] : files_)
+  for (auto& [name, file] : _files)
     if (file.state == File::Arriving) wasRenamed(file, gone);
-  listed_ = true;
-  idle_ = false;
+  _listed = true;
+  _idle = false;
 }
 
 // False: it has gone, or is no regular file.
 bool PictureFolder::read(const std::string& name, File& file) const {
-  return see(file, FileState::of(path_ + "/" + name));
+  return see(file, FileState::of(_path + "/" + name));
 }
 
 bool PictureFolder::see(File& file, const std::optional<FileState>& now) {
@@ -160,7 +160,7 @@ bool PictureFolder::see(File& file, const std::optional<FileState>& now) {
 }
 
 void PictureFolder::forget(Files& files, Files::iterator file, Gone& gone) const {
-  if (types_.of(file->first)) gone.insert_or_assign(file->second.seen.inode, file->second);
+  if (_types.of(file->first)) gone.insert_or_assign(file->second.seen.inode, file->second);
   files.erase(file);
 }
 
@@ -178,22 +178,22 @@ bool PictureFolder::wasRenamed(File& file, const Gone& gone) {
 void PictureFolder::apply(const std::vector<FolderEvent>& events) {
   Gone gone;
   for (const FolderEvent& event : events) {
-    if (event.name.empty()) away_ = away_ || event.what == FolderEvent::Gone;
+    if (event.name.empty()) _away = _away || event.what == FolderEvent::Gone;
     if (!event.name.empty() && event.name.front() != '.') apply(event, gone);
   }
-  if (!events.empty()) idle_ = false;
+  if (!events.empty()) _idle = false;
 }
 
 void PictureFolder::apply(const FolderEvent& event, Gone& gone) {
-  const auto known = files_.find(event.name);
-  const bool isKnown = known != files_.end();
-  if (event.what == FolderEvent::Gone) return isKnown ? forget(files_, known, gone) : void();
+  const auto known = _files.find(event.name);
+  const bool isKnown = known != _files.end();
+  if (event.what == FolderEvent::Gone) return isKnown ? forget(_files, known, gone) : void();
   if (event.what == FolderEvent::Appeared && isKnown) return;
   File file = isKnown && event.what != FolderEvent::MovedIn ? known->second : File();
   const FileState before = file.seen;
   if (!read(event.name, file)) {
     // What happened to its contents does. Otherwise it may only be out of sight, together with its folder.
-    if (event.what == FolderEvent::Changed || event.what == FolderEvent::MovedIn) files_.erase(event.name);
+    if (event.what == FolderEvent::Changed || event.what == FolderEvent::MovedIn) _files.erase(event.name);
     return;
   }
   switch (event.what) {
@@ -217,7 +217,7 @@ void PictureFolder::apply(const FolderEvent& event, Gone& gone) {
     default:
       break;
   }
-  files_.insert_or_assign(event.name, file);
+  _files.insert_or_assign(event.name, file);
 }
 
 void PictureFolder::becomeWhole(File& file) {
@@ -227,12 +227,12 @@ void PictureFolder::becomeWhole(File& file) {
 }
 
 bool PictureFolder::rested(const File& file) const {
-  return Clock::now() - file.since >= rest_ || (file.seen.size > 0 && isOlder(file.seen.modified, rest_));
+  return Clock::now() - file.since >= _rest || (file.seen.size > 0 && isOlder(file.seen.modified, _rest));
 }
 
 // Of what nobody told that it is whole.
 void PictureFolder::settle() {
-  for (auto& [name, file] : files_) {
+  for (auto& [name, file] : _files) {
     if (file.state != File::Arriving || file.writer == File::Writes || !rested(file)) continue;
     if (!read(name, file) || !rested(file)) continue;
     file.since = Clock::now();
@@ -244,14 +244,14 @@ void PictureFolder::settle() {
 
 std::vector<Shot> PictureFolder::take(size_t most) {
   std::vector<Shot> shots;
-  if (idle_) return shots;
+  if (_idle) return shots;
   settle();
-  idle_ = true;
-  for (auto file = files_.begin(); file != files_.end() && shots.size() < most; ++file) {
+  _idle = true;
+  for (auto file = _files.begin(); file != _files.end() && shots.size() < most; ++file) {
     if (file->second.state == File::Known) continue;
-    idle_ = false;
+    _idle = false;
     if (file->second.state != File::Whole) continue;
-    const std::optional<uint32_t> type = types_.of(file->first);
+    const std::optional<uint32_t> type = _types.of(file->first);
     if (!type) {
       file->second.state = File::Known;
       continue;
@@ -266,34 +266,34 @@ std::vector<Shot> PictureFolder::take(size_t most) {
 // The other half, as long as it has not been taken by itself.
 PictureFolder::Files::iterator PictureFolder::partnerOf(const std::string& name, uint32_t type) {
   const std::string base = baseOf(name);
-  for (auto other = files_.lower_bound(base + "."); other != files_.end(); ++other) {
+  for (auto other = _files.lower_bound(base + "."); other != _files.end(); ++other) {
     if (other->first.compare(0, base.size() + 1, base + ".") != 0) break;
     const File& file = other->second;
     const bool comes = file.state == File::Whole ||
                        (file.state == File::Arriving && (file.writer == File::Writes || file.seen.size > 0));
-    const std::optional<uint32_t> otherType = types_.of(other->first);
+    const std::optional<uint32_t> otherType = _types.of(other->first);
     if (comes && baseOf(other->first) == base && otherType && arePair(type, *otherType)) return other;
   }
-  return files_.end();
+  return _files.end();
 }
 
 bool PictureFolder::takes(const File& file, uint32_t type, Files::iterator partner) const {
-  if (partner != files_.end()) return partner->second.state == File::Whole;
+  if (partner != _files.end()) return partner->second.state == File::Whole;
   const bool half = type == kNkMAIDFileDataType_NEF || type == kNkMAIDFileDataType_JPEG;
-  return !pairsExpected_ || !half || Clock::now() - file.since >= kPairGrace;
+  return !_pairsExpected || !half || Clock::now() - file.since >= kPairGrace;
 }
 
 // Nothing where one of them is out of sight all of a sudden; with its folder, perhaps.
 Shot PictureFolder::handOut(Files::iterator file, Files::iterator partner) {
   Shot shot;
   for (const auto& half : {file, partner}) {
-    if (half == files_.end()) continue;
-    shot.push_back(Picture::file(*types_.of(half->first), path_ + "/" + half->first));
-    if (!shot.back().source->isThere()) return {};
+    if (half == _files.end()) continue;
+    shot.push_back(filePicture(*_types.of(half->first), _path + "/" + half->first));
+    if (!isThere(shot.back())) return {};
   }
   file->second.state = File::Known;
   file->second.handedOut = shot.front().source;
-  if (partner == files_.end()) return shot;
+  if (partner == _files.end()) return shot;
   partner->second.state = File::Known;
   partner->second.handedOut = shot.back().source;
   // The RAW comes first, as cameras send it.

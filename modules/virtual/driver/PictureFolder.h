@@ -14,7 +14,7 @@
 
 #include "FileState.h"
 #include "FolderEvents.h"
-#include "Picture.h"
+#include "Pictures.h"
 
 namespace virtualcamera {
 
@@ -30,18 +30,18 @@ class FileTypes {
 // after another can leave the folder's time stamp as it was, so that it keeps saying yes for a second.
 class FolderWatch {
  public:
-  explicit FolderWatch(std::string path) : path_(std::move(path)) {}
+  explicit FolderWatch(std::string path) : _path(std::move(path)) {}
 
   bool changed();
   // The entries could not be read this time: the next look finds them changed again.
-  void retry() { exists_ = false; }
-  const std::string& path() const { return path_; }
+  void retry() { _exists = false; }
+  const std::string& path() const { return _path; }
 
  private:
-  std::string path_;
-  int64_t modified_ = 0;
-  std::chrono::steady_clock::time_point since_{};  // of the time stamp
-  bool exists_ = false;
+  std::string _path;
+  int64_t _modified = 0;
+  std::chrono::steady_clock::time_point _since{};  // of the time stamp
+  bool _exists = false;
 };
 
 struct FolderEntry {
@@ -65,7 +65,7 @@ class PictureFolder {
   enum class First { Known, New };  // what is there when it is first looked at
 
   PictureFolder(std::string path, std::shared_ptr<FolderEvents> events, std::chrono::milliseconds rest, First first)
-      : path_(std::move(path)), events_(std::move(events)), rest_(rest), first_(first) {}
+      : _path(std::move(path)), _events(std::move(events)), _rest(rest), _first(first) {}
   ~PictureFolder() { leave(); }
   PictureFolder(const PictureFolder&) = delete;
   PictureFolder& operator=(const PictureFolder&) = delete;
@@ -80,7 +80,7 @@ class PictureFolder {
   // Nobody looks for a while. What is known of the files is kept.
   void leave();
   // Whether the folder is away, or has been since it was last left.
-  bool wasAway() const { return away_; }
+  bool wasAway() const { return _away; }
 
  private:
   struct File {
@@ -109,20 +109,20 @@ class PictureFolder {
   bool takes(const File& file, uint32_t type, Files::iterator partner) const;
   Shot handOut(Files::iterator file, Files::iterator partner);
 
-  std::string path_;
-  std::shared_ptr<FolderEvents> events_;
-  std::chrono::milliseconds rest_;
-  First first_;
-  FileTypes types_{};
-  bool pairsExpected_ = false;
-  int watch_ = -1;
-  ino_t inode_ = 0;  // of the folder when it was last looked at, as is its time stamp
-  int64_t modified_ = 0;
-  Clock::time_point nextListing_{};
-  bool away_ = false;
-  bool listed_ = false;
-  bool idle_ = false;  // there is nothing to take or to wait for
-  Files files_{};
+  std::string _path;
+  std::shared_ptr<FolderEvents> _events;
+  std::chrono::milliseconds _rest;
+  First _first;
+  FileTypes _types{};
+  bool _pairsExpected = false;
+  int _watch = -1;
+  ino_t _inode = 0;  // of the folder when it was last looked at, as is its time stamp
+  int64_t _modified = 0;
+  Clock::time_point _nextListing{};
+  bool _away = false;
+  bool _listed = false;
+  bool _idle = false;  // there is nothing to take or to wait for
+  Files _files{};
 };
 
 }  // namespace virtualcamera

@@ -52,7 +52,7 @@ TEST_F(ObjectTree, AFailedOpenReportsTheSdkResultAndLeavesNothing) {
   root = std::make_unique<CNikonObject>(Model::entryPoint(), "module");
   EXPECT_EQ(root->openChild(5, "camera"), nullptr);
   EXPECT_EQ(recorder.traced("Error opening child: "), 1U);
-  model.failCall(1, kNkMAIDResult_MissingComponent);
+  model.faults().add({.times = 1, .answer = kNkMAIDResult_MissingComponent});
   EXPECT_EQ(InitializeNikonModule(Model::entryPoint(), "module"), kNkMAIDResult_MissingComponent);
   EXPECT_EQ(recorder.traced("Error from Command_Open: kNkMAIDResult_MissingComponent"), 1U);
   EXPECT_EQ(InitializeNikonModule(Model::entryPoint(), "module"), 0);

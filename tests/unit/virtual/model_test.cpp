@@ -4,9 +4,13 @@
 #include <thread>
 
 #include "Client.h"
+#include "VirtualCamera.h"
 
 namespace virtualcamera::test {
 namespace {
+
+using camerakit::test::Client;
+using camerakit::test::Opened;
 
 struct ModelTest : testing::Test {
   Model model{{.closeWait = std::chrono::minutes(1)}};
@@ -46,30 +50,11 @@ TEST_F(ModelTest, WhatAClientDoesWrongIsAnsweredWithItsResult) {
   EXPECT_EQ(model.openObjects(), 0u);
 }
 
-TEST_F(ModelTest, EachCallInTurnCanFail) {
-  const auto session = [] {
-    Client top;
-    if (top.opened != 0) return false;
-    Client below(top, 1);
-    return below.opened == 0 && below.name() != "!";
-  };
-  model.failCall(0, 0, {.closes = false});
-  EXPECT_TRUE(session());
-  EXPECT_EQ(model.countedCalls(), 7u);  // per object an open and two callbacks; the name
-  std::vector<uint64_t> fatal;
-  for (uint64_t k = 1; k <= 7; ++k) {
-    model.failCall(k, kNkMAIDResult_UnexpectedError, {.closes = false});
-    if (!session()) fatal.push_back(k);
-    EXPECT_EQ(model.openObjects(), 2u);
-  }
-  EXPECT_EQ(fatal, (std::vector<uint64_t>{1, 4, 7}));
-}
-
 TEST_F(ModelTest, AnUnpluggedCameraAnswersTheShotsOfWhichAByteIsMissing) {
   camera.setTransfer({.deliveryBytes = 400});
-  camera.shootPair(Picture::pattern(kNkMAIDFileDataType_NEF, 1), Picture::jpeg({1, 2}));
-  camera.shootPair(Picture::pattern(kNkMAIDFileDataType_NEF, 3), Picture::jpeg({1, 2, 3, 4}));
-  for (const uint64_t size : {1000, 400}) camera.shoot(Picture::pattern(kNkMAIDFileDataType_NEF, size));
+  camera.shootPair(patternPicture(kNkMAIDFileDataType_NEF, 1), Picture::jpeg({1, 2}));
+  camera.shootPair(patternPicture(kNkMAIDFileDataType_NEF, 3), Picture::jpeg({1, 2, 3, 4}));
+  for (const uint64_t size : {1000, 400}) camera.shoot(patternPicture(kNkMAIDFileDataType_NEF, size));
   EXPECT_EQ(Opened(device, 1).transfer(), kNkMAIDResult_NoError);
   Opened part(device, 5);
   part.data.start(kNkMAIDCapability_Acquire);
@@ -109,7 +94,7 @@ TEST_F(ModelTest, CamerasGoWhileOneThreadPollsTheModuleAndAnotherTransfers) {
   for (int round = 0; round < 200 || transfers < 20; ++round) {
     Camera& coming = model.addCamera(1, "Coming and going");
     coming.setTransfer({.deliveryBytes = 1000, .inModulePolls = true});
-    coming.shoot(Picture::pattern(kNkMAIDFileDataType_JPEG, 50'000));
+    coming.shoot(patternPicture(kNkMAIDFileDataType_JPEG, 50'000));
     std::this_thread::yield();
     model.removeCamera(1);
   }

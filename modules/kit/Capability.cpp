@@ -3,7 +3,7 @@
 #include <algorithm>
 #include <cstring>
 
-namespace virtualcamera {
+namespace camerakit {
 namespace {
 
 bool ofStrings(const Enumeration& list) {
@@ -96,18 +96,19 @@ int32_t Capability::read(uint32_t dataType, void* data) const {
   return kNkMAIDResult_UnexpectedDataType;
 }
 
-std::vector<Capability> defaultSettings() {
-  return {
-      Capability::unsigneds(kNkMAIDCapability_Sensitivity, {100, 200, 400, 800, 1600, 3200, 6400}, 2),
-      Capability::integer(kNkMAIDCapability_BatteryLevel, 85),
-      Capability::unsignedInteger(kNkMAIDCapability_FreeBytes, 842),
-      Capability::packedStrings(kNkMAIDCapability_ExposureMode,
-                                {"Program", "Aperture priority", "Shutter priority", "Manual"}, 3),
-      Capability::packedStrings(kNkMAIDCapability_Aperture, {"f/1.8", "f/2.8", "f/4", "f/5.6", "f/8", "f/11"}, 3),
-      Capability::packedStrings(kNkMAIDCapability_ShutterSpeed, {"1/1000", "1/500", "1/250", "1/125", "1/60", "1"}, 3),
-      Capability::strings(kNkMAIDCapability_WBMode, {"Auto", "Incandescent", "Fluorescent", "Direct sunlight"}, 0),
-      Capability::unsignedInteger(kNkMAIDCapability_SaveMedia, 0),
-  };
+int32_t Capability::readElements(uint32_t dataType, void* data) const {
+  const Enumeration* list = std::get_if<Enumeration>(&value);
+  if (list == nullptr || dataType != kNkMAIDDataType_EnumPtr || data == nullptr)
+    return kNkMAIDResult_UnexpectedDataType;
+  const auto* room = static_cast<const tagNkMAIDEnum*>(data);
+  const tagNkMAIDEnum header = list->header();
+  if (room->elementCount != header.elementCount || room->elementSize != header.elementSize)
+    return kNkMAIDResult_BufferSize;
+  const std::vector<uint8_t> bytes = list->elements();
+  if (bytes.empty()) return kNkMAIDResult_NoError;
+  if (room->elements == nullptr) return kNkMAIDResult_BufferSize;
+  std::memcpy(room->elements, bytes.data(), bytes.size());
+  return kNkMAIDResult_NoError;
 }
 
-}  // namespace virtualcamera
+}  // namespace camerakit

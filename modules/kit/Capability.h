@@ -1,4 +1,4 @@
-// A capability with its value: what a client finds when it reads a setting of a virtual camera.
+// A capability with its value: what a client finds when it reads what an object announces.
 #pragma once
 
 #include <cstddef>
@@ -10,7 +10,7 @@
 
 #include "MAID.h"
 
-namespace virtualcamera {
+namespace camerakit {
 
 // The entries of an enumeration, all of one element type, and which of them is the current one. The index is passed on
 // as it is, beyond the entries too.
@@ -49,9 +49,8 @@ struct Capability {
 
   // The value into what data points to, as the data type says. Answers UnexpectedDataType where the two do not fit.
   int32_t read(uint32_t dataType, void* data) const;
+  // The elements into the block of the record that data points to. BufferSize where there is no room for just these.
+  int32_t readElements(uint32_t dataType, void* data) const;
 };
 
-// The settings a camera has when a script says nothing else.
-std::vector<Capability> defaultSettings();
-
-}  // namespace virtualcamera
+}  // namespace camerakit

@@ -7,9 +7,9 @@
 #include <utility>
 #include <vector>
 
-#include "VirtualCamera.h"
+#include "CameraKit.h"
 
-namespace virtualcamera::test {
+namespace camerakit::test {
 
 // Opens in the constructor, registers its callbacks, closes in the destructor.
 class Client {
@@ -102,4 +102,4 @@ struct Opened {
   Client data;
 };
 
-}  // namespace virtualcamera::test
+}  // namespace camerakit::test
