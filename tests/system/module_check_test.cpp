@@ -36,6 +36,7 @@ const std::string kGood = "keeps the contract";
 
 const Case kCases[] = {
     broken("", kGood),
+    {EXAMPLE_KIT_MODULE, "", "1 camera, 2 pictures transferred: " + kGood},
     virtualCamera(R"({"pairs": true})", "1 camera, 4 pictures transferred: " + kGood),
     virtualCamera(R"({"transfer": {"inModulePolls": true, "deliveryBytes": 1000}})", kGood),
     virtualCamera(R"({"capture": {"answer": "OutOfFocus"}})", "note: camera 1: CapStart Capture answered OutOfFocus"),
