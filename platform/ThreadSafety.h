@@ -16,6 +16,5 @@
 #define ACQUIRE(...) TETHER_THREAD_ATTRIBUTE(acquire_capability(__VA_ARGS__))
 #define RELEASE(...) TETHER_THREAD_ATTRIBUTE(release_capability(__VA_ARGS__))
 #define TRY_ACQUIRE(...) TETHER_THREAD_ATTRIBUTE(try_acquire_capability(__VA_ARGS__))
-#define ACQUIRED_AFTER(...) TETHER_THREAD_ATTRIBUTE(acquired_after(__VA_ARGS__))
 #define RETURN_CAPABILITY(lock) TETHER_THREAD_ATTRIBUTE(lock_returned(lock))
 #define NO_THREAD_SAFETY_ANALYSIS TETHER_THREAD_ATTRIBUTE(no_thread_safety_analysis)

@@ -27,10 +27,11 @@ inline constexpr std::int32_t kNotAnnounced = 50000;
 // No array that the SDK announces is believed to be larger than this many bytes.
 inline constexpr std::uint64_t kLargestSdkArray = std::uint64_t{64} << 20;
 
-// Held by a CNikonObject destructor for its whole subtree, and by whoever is to decide that an item is deleted.
-extern platform::RecursiveTimedLock& gNikonObjectLock;
 // Held while an item is downloaded, while settings are gathered, and at the end of the service.
 extern platform::RecursiveTimedLock& gNikonAsyncLock;
+// Held by a CNikonObject destructor for its whole subtree, and by whoever is to decide that an item is deleted. Never
+// held when the other one is taken.
+extern platform::RecursiveTimedLock& gNikonObjectLock;
 inline platform::RecursiveTimedLock& getAsyncLock() { return gNikonAsyncLock; }
 
 class CNikonCallbackReceiver {
