@@ -17,6 +17,7 @@
 #include "Descriptors.h"
 #include "ExclusiveRename.h"
 #include "FileManager.h"
+#include "PictureType.h"
 
 namespace tether {
 namespace {
@@ -176,7 +177,7 @@ MovedFile FileMover::move(const std::string& source, const std::string& announce
                   " announced");
   }
 
-  const std::string bare = bareName(announced);
+  const std::string bare = nameByContent(bareName(announced), file.get());
   const std::string_view plain = platform::deletingPathExtension(bare);
   Name name{base ? *base : std::string(plain), bare.substr(plain.size()), firstOfPair && !base, {}, 1};
   if (name.sparesBases) {
@@ -236,7 +237,8 @@ MovedFile& FileMover::removeFirst(MovedFile& moved, const std::string& to) {
 }
 
 std::optional<MovedFile> FileMover::finish(const std::string& source, const std::string& announced) {
-  const std::string bare = bareName(announced);
+  const Descriptor first(open(source.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
+  const std::string bare = nameByContent(bareName(announced), first.get());
   const std::string_view base = platform::deletingPathExtension(bare);
   const std::string_view extension = std::string_view(bare).substr(base.size());
   for (const std::string& other : platform::FileManager::contents(_folder)) {

@@ -1,8 +1,9 @@
 // Takes finished pictures out of the helper's temporary directory into a folder.
 //
 // Nothing that is in the folder is ever overwritten, and no link in it followed: where a name is taken the file becomes
-// "name-2.jpg", "name-3.jpg" and so on. A file is renamed where that is possible. Into another file system it is copied
-// under a hidden name in the folder, checked for its size, given its name, and only then the first copy removed.
+// "name-2.jpg", "name-3.jpg" and so on. A ".dat" gets the extension that its content says (PictureType.h). A file is
+// renamed where that is possible. Into another file system it is copied under a hidden name in the folder, checked for
+// its size, given its name, and only then the first copy removed.
 //
 // Whichever way it goes, its bytes are flushed to the disk before it has its name, and the folder after: what is said
 // to be moved outlasts a loss of power. Whatever goes wrong, a flush too, leaves the file where it was and nothing half

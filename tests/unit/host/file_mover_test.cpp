@@ -61,6 +61,39 @@ class FileMoverTest : public testing::Test {
   const std::string content = std::string(3'000'000, 'x') + "end";
 };
 
+// A TIFF of one entry, with a text of ten bytes behind it.
+std::string tiff(bool big, int tag, const std::string& text) {
+  std::string bytes(big ? "MM\0*" : "II*\0", 4);
+  const auto add = [&](int value, int size) {
+    for (int i = 0; i < size; ++i) bytes += static_cast<char>(value >> 8 * (big ? size - 1 - i : i));
+  };
+  add(8, 4);
+  for (const auto& [value, size] : {std::pair{1, 2}, {tag, 2}, {2, 2}, {10, 4}, {26, 4}}) add(value, size);
+  return bytes + std::string(4, '\0') + text;
+}
+
+TEST_F(FileMoverTest, GivesDataTheExtensionThatItsContentSays) {
+  FileMover mover(to.path());
+  constexpr int kMake = 0x010F;
+  const std::pair<std::string, const char*> kinds[] = {{tiff(false, kMake, std::string("SONY\0", 5)), "arw"},
+                                                       {tiff(true, kMake, "PENTAX Corporation"), "pef"},
+                                                       {tiff(true, 0xC612, ""), "dng"},
+                                                       {tiff(false, kMake, "Somebody"), "tif"},
+                                                       {tiff(false, 0xFFFF, "").substr(0, 9), "tif"},
+                                                       {std::string("\0\0\0\x18"
+                                                                    "ftypcrx \0\0\0\x01",
+                                                                    16),
+                                                        "cr3"},
+                                                       {std::string("IIU\0\x18\0\0\0", 8), "rw2"},
+                                                       {"FUJIFILMCCD-RAW 0201FF129502", "raf"},
+                                                       {"no picture", "dat"},
+                                                       {"", "dat"}};
+  for (const auto& [bytes, extension] : kinds) {
+    const auto moved = mover.move(from.write("Capture0001.dat", bytes), "Capture0001.dat");
+    EXPECT_TRUE(std::filesystem::remove(to / (std::string("Capture0001.") + extension))) << moved.path;
+  }
+}
+
 TEST_F(FileMoverTest, MovesAFileUnderItsAnnouncedNameReadableLikeAnyNewFile) {
   FileMover mover(to.path());
   const std::string source = from.write("Capture0001-1.jpg", content);
