@@ -9,6 +9,7 @@
 #include <cerrno>
 #include <chrono>
 #include <cstdlib>
+#include <filesystem>
 #include <fstream>
 #include <map>
 #include <set>
@@ -32,6 +33,12 @@ constexpr off_t kLongestRecord = off_t{64} << 20;
 // A helper that finds its input at an end is gone within two seconds.
 constexpr auto kHelperEnds = 3s;
 constexpr auto kLookAgain = 20ms;
+
+// Paths in it are told to others, who may be elsewhere.
+std::string temporaryDirectory() {
+  std::error_code ignored;
+  return std::filesystem::absolute(platform::temporaryDirectory(), ignored).string();
+}
 
 std::string recordIn(const std::string& directory) { return platform::appendingPathComponent(directory, kRecord); }
 
@@ -65,7 +72,7 @@ void noteMoveIn(const Descriptor& record, const std::string& file) {
 }  // namespace
 
 PrivateDirectory::PrivateDirectory(const std::string& folder)
-    : _path(platform::appendingPathComponent(platform::temporaryDirectory(), std::string(kPrefix).append(kSuffix))) {
+    : _path(platform::appendingPathComponent(temporaryDirectory(), std::string(kPrefix).append(kSuffix))) {
   const auto failed = [this] { return std::system_error(errno, std::generic_category(), _path); };
   if (mkdtemp(_path.data()) == nullptr) throw failed();
   try {
@@ -120,7 +127,7 @@ std::vector<std::string> PrivateDirectory::tidy() const {
 
 std::vector<std::string> possiblyAbandonedDirectories() {
   std::vector<std::string> paths;
-  const std::string temporary = platform::temporaryDirectory();
+  const std::string temporary = temporaryDirectory();
   for (const std::string& name : platform::FileManager::contents(temporary)) {
     if (name.size() != kPrefix.size() + kSuffix.size() || !name.starts_with(kPrefix)) continue;
     paths.push_back(platform::appendingPathComponent(temporary, name));
