@@ -1,11 +1,6 @@
 #include "Link.h"
 
-#include <fcntl.h>
-#include <unistd.h>
-
 #include <algorithm>
-#include <cerrno>
-#include <cstring>
 #include <system_error>
 
 #include "Report.h"
@@ -38,8 +33,7 @@ Link::Link(const Options& options, Console& console, std::shared_ptr<Wakeup> wak
   try {
     _log = openForLog(options.helperLog.empty() ? "/dev/null" : options.helperLog);
   } catch (const std::system_error& problem) {
-    const bool exhausted = problem.code().value() == EMFILE || problem.code().value() == ENFILE;
-    throw Failure{exhausted ? kHelperLost : kUsage, std::string("cannot write ") + problem.what()};
+    throw Failure{statusWithoutFile(problem.code().value()), std::string("cannot write ") + problem.what()};
   }
 }
 

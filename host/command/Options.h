@@ -1,6 +1,7 @@
 // What the command line asks for, and how the command ends.
 #pragma once
 
+#include <cerrno>
 #include <chrono>
 #include <optional>
 #include <string>
@@ -37,6 +38,9 @@ struct Failure {
   int status;
   std::string text;
 };
+
+// What it ends with where a file cannot be made: with that name, or none at all.
+inline int statusWithoutFile(int error) { return error == EMFILE || error == ENFILE ? kHelperLost : kUsage; }
 
 // How a command ended, for the last line that it prints.
 struct Outcome {

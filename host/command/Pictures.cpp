@@ -37,7 +37,8 @@ std::string preparedFolder(const std::string& given) {
   while (folder.size() > 1 && folder.back() == '/') folder.pop_back();
   std::string tried = platform::appendingPathComponent(folder, ".tether.XXXXXX");
   const Descriptor file(mkstemp(tried.data()));
-  if (!file) throw Failure{kUsage, "cannot write in the folder " + folder + ": " + std::strerror(errno)};
+  if (!file)
+    throw Failure{statusWithoutFile(errno), "cannot write in the folder " + folder + ": " + std::strerror(errno)};
   unlink(tried.c_str());
   return folder;
 }
