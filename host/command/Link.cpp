@@ -156,8 +156,8 @@ std::optional<Camera> Link::wanted() const {
     if (_chosen && name == _chosen->name) alike.push_back(camera);
     found.push_back(camera);
   }
-  // Another of its name may be the same one under another id, if there is but one.
-  if (_chosen) return alike.size() == 1 ? std::optional(alike.front()) : std::nullopt;
+  // Another of its name may be the same one under another id, if there never was but one.
+  if (_chosen) return alike.size() == 1 && !_hadNamesake ? std::optional(alike.front()) : std::nullopt;
   return found.empty() ? std::nullopt : std::optional(found.front());
 }
 
@@ -197,6 +197,8 @@ void Link::failWithoutCamera() const {
 void Link::connect(const Camera& camera) {
   _probed.reset();
   const Reply reply = _session->connect(camera.id, Clock::now() + timeout());
+  const auto isNamesake = [&](const auto& other) { return other.first != camera.id && other.second == camera.name; };
+  _hadNamesake = _hadNamesake || std::any_of(_cameras.begin(), _cameras.end(), isNamesake);
   if (reply.kind != Reply::Kind::kOk) fail(reply, "connecting " + camera.name);
   _chosen = camera;
   _probed = camera.id & ~kCameraBits;

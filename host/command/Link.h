@@ -93,6 +93,7 @@ class Link {
   bool _hadAny = false;
   Camera _lastRemoved;
   std::optional<Camera> _chosen;  // connected last, in this helper or one before
+  bool _hadNamesake = false;      // another of its name was there, too
   std::optional<std::int32_t> _probed;
   std::deque<Clock::time_point> _losses;
   Clock::time_point _startedAt;

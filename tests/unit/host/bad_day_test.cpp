@@ -149,7 +149,7 @@ TEST(BadDayTest, Capture) {
        {"there is no camera 257; there is 513 (Cam)\n"},
        {}},
       {"a camera that does not come back",
-       "doCapture: exit 1\n---\nstart: add 258 Other\n",
+       "start: add 257 Cam; add 513 Cam\ndoCapture: exit 1\n---\nstart: add 513 Cam\n",
        "--count 2",
        3,
        {"Cam has not come back"},
