@@ -196,12 +196,14 @@ void Link::failWithoutCamera() const {
 
 void Link::connect(const Camera& camera) {
   _probed.reset();
-  const Reply reply = _session->connect(camera.id, Clock::now() + timeout());
   const auto isNamesake = [&](const auto& other) { return other.first != camera.id && other.second == camera.name; };
   _hadNamesake = _hadNamesake || std::any_of(_cameras.begin(), _cameras.end(), isNamesake);
+  const Reply reply = _session->connect(camera.id, Clock::now() + timeout());
+  // The helper turns to its module also where the camera refuses.
+  const bool answered = reply.kind == Reply::Kind::kOk || reply.kind == Reply::Kind::kError;
+  if (answered) _probed = camera.id & ~kCameraBits;
   if (reply.kind != Reply::Kind::kOk) fail(reply, "connecting " + camera.name);
   _chosen = camera;
-  _probed = camera.id & ~kCameraBits;
 }
 
 std::optional<std::int32_t> Link::probe() {

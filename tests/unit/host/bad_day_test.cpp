@@ -164,12 +164,13 @@ TEST(BadDayTest, Capture) {
 TEST(BadDayTest, Watch) {
   const Row table[] = {
       {"one that refuses keeps nobody from being connected",
-       "start: add 257 A; add 513 B\nconnectDevice: error | ok; picture a.jpg",
+       "start: add 257 A; add 513 B\nconnectDevice: error | ok | error; announce a.jpg; break; after 1900 picture "
+       "b.jpg",
        "--count 1",
-       0,
-       {"tether: connecting A failed: error 0; trying again\n"},
-       {"a.jpg"},
-       {"B .513. connected\na.jpg  1.0 kB  [0-9.]* s\n"}},
+       4,
+       {"tether: connecting A failed: error 0; trying again\n", "a.jpg was not received: its transfer broke off\n"},
+       {"b.jpg"},
+       {"B .513. connected\nb.jpg  1.0 kB  [0-9.]* s\n"}},
       {"two of one name",
        "start: add 257 Cam; add 513 Cam\nconnectDevice: ok; picture a.jpg",
        "--count 1 --camera 0513",
