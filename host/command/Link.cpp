@@ -83,6 +83,7 @@ void Link::end(std::chrono::milliseconds grace, const Take& take) {
   _session->end(grace);
   for (auto event = _session->nextEvent(Clock::now()); event && !std::holds_alternative<HelperLost>(*event);
        event = _session->nextEvent(Clock::now())) {
+    note(*event);
     take(*event);
   }
   _ended.push_back(_session->directory());
