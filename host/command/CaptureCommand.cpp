@@ -122,7 +122,7 @@ class Capture {
         if (event) handle(*event);
         if (_gone) throwGone();
       }
-      _due = Clock::now();
+      _due = std::max(_due, Clock::now());
       return true;
     } catch (const Failure& failure) {
       if (failure.status != kHelperLost || !_link.session().lost()) throw;

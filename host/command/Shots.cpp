@@ -253,6 +253,7 @@ void Shots::giveUp(const std::string& reason, Time now) {
   _numbers.clear();
   _halves.clear();
   _probes.clear();
+  _calm = kCalm;
   for (auto entry = _pictures.begin(); entry != _pictures.end();) {
     entry = entry->second.lost ? _pictures.erase(entry) : std::next(entry);
   }
