@@ -22,6 +22,8 @@ constexpr auto kEndGrace = 5s;
 // Who was stopped, or held up, for longer than this has seen nothing of what came meanwhile.
 constexpr auto kPause = 1s;
 constexpr auto kDiskStep = 1s;
+// So much earlier than an announcement a line of the log may be taken that was written after it.
+constexpr auto kLineAhead = 1s;
 // With less room than this no picture can be received.
 constexpr std::uint64_t kLittleRoom = std::uint64_t{1} << 20;
 
@@ -70,13 +72,17 @@ std::optional<Event> Pictures::next(Clock::time_point until) {
   probe();
   until = std::min(until, _shots.nextCheck(Clock::now()));
   if (_link.canProbe()) until = std::min(until, _shots.nextProbe());
+  if (!_strays.empty()) until = std::min(until, _strays.front().since + kLineAhead);
   auto event = _link.next(until);
   if (!event) notePause(until);
   if (event) take(*event);
   takeSaved();
   takeLeftovers();
   // What came is looked at before anything is held to be missing.
-  if (!event) _shots.check(Clock::now());
+  if (!event) {
+    _shots.check(Clock::now());
+    tellStrays(Clock::now() - kLineAhead);
+  }
   tellNotices();
   if (!event && _saving.empty()) _link.tidy(_left);
   _handled = Clock::now();
@@ -99,6 +105,7 @@ void Pictures::take(const Event& event) {
     const Picture& picture = _shots.announced(*added, _link.onlyCamera(), now);
     tellNotices();  // of the one before
     _report.receiving(picture);
+    giveLog(picture);
   } else if (const auto* const complete = std::get_if<FileDownloadComplete>(&event)) {
     save(_shots.completed(*complete, _link.onlyCamera(), now), complete->file_path);
   } else if (const auto* const other = std::get_if<OtherMessage>(&event)) {
@@ -144,6 +151,7 @@ void Pictures::restart(const HelperLost& lost) {
   _link.end(0s, [this](const Event& event) { take(event); });
   _report.helperLost(lost.description);
   _shots.giveUp(lost.description, Clock::now());
+  tellStrays(Clock::now());
   tellNotices();
   _link.restart(lost);
 }
@@ -202,10 +210,24 @@ void Pictures::takeLog(const std::string& line) {
   _report.helperLog(line, _options.helperLog == "-");
   if (_shots.remark(line)) return;
   // Of a picture that nobody waits for nothing else will tell.
-  const std::string trouble = troubleInDirectory();
-  if (trouble.empty()) return;
-  _shots.neverCame();
-  _report.neverCame(line + "; " + trouble);
+  std::string trouble = troubleInDirectory();
+  if (!trouble.empty()) _strays.push_back({line, std::move(trouble), Clock::now()});
+}
+
+// A line may overtake the announcement of the picture that it is about.
+void Pictures::giveLog(const Picture& picture) {
+  const auto stray = std::find_if(_strays.begin(), _strays.end(),
+                                  [&](const Stray& one) { return one.line.find(picture.name) != std::string::npos; });
+  if (stray == _strays.end()) return;
+  _shots.remark(stray->line);
+  _strays.erase(stray);
+}
+
+void Pictures::tellStrays(Clock::time_point until) {
+  for (; !_strays.empty() && _strays.front().since <= until; _strays.pop_front()) {
+    _shots.neverCame();
+    _report.neverCame(_strays.front().line + "; " + _strays.front().trouble);
+  }
 }
 
 void Pictures::tellNotices() {
@@ -247,6 +269,7 @@ int Pictures::finish(const Failure& failure) {
   _link.finishing();
   _link.end(kEndGrace, [this](const Event& event) { take(event); });
   _shots.giveUp(failure.status == kInterrupted ? "interrupted" : "the helper has ended", Clock::now());
+  tellStrays(Clock::now());
   tellNotices();
   waitForDisk();
   _link.tidy(_left);

@@ -2,6 +2,7 @@
 // Takes every event, keeps the ledger, has files saved, and says what has become of each.
 #pragma once
 
+#include <deque>
 #include <map>
 #include <memory>
 #include <optional>
@@ -54,6 +55,8 @@ class Pictures {
   void takeLeftovers();
   void takeLog(const std::string& line);
   void tellNotices();
+  void giveLog(const Picture& picture);
+  void tellStrays(Clock::time_point until);
   void unplugged(const DeviceRemoved& removed);
   std::string troubleInDirectory() const;
   void waitBriefly();
@@ -70,6 +73,12 @@ class Pictures {
   std::map<int, Picture> _saving;
   std::set<std::string> _left;  // paths of what could not be saved
   Clock::time_point _handled = Clock::now();
+  struct Stray {
+    std::string line;
+    std::string trouble;
+    Clock::time_point since;
+  };
+  std::deque<Stray> _strays;  // of the helper's log, on pictures that have not been announced
 };
 
 }  // namespace tether::command

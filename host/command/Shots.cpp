@@ -232,14 +232,18 @@ void Shots::unplugged(const std::string& reason, Time now) {
 
 bool Shots::remark(const std::string& text) {
   if (_receiving != 0) {
-    _pictures.at(_receiving).remark = text;
-  } else if (!_shutters.empty()) {
-    // Of several that are overdue it is the last one's: the others had their time.
-    const auto shutter = turn();
-    (shutter->overdue ? _shutters.back() : *shutter).remark = text;
-  } else {
-    return false;
+    Entry& entry = _pictures.at(_receiving);
+    const auto isItsOwn = [&](const std::string& line) { return line.find(entry.file.name) != std::string::npos; };
+    // Else it is the next one's, whose announcement is still to be taken.
+    if (!isItsOwn(entry.remark) || isItsOwn(text)) {
+      entry.remark = text;
+      return true;
+    }
   }
+  if (_shutters.empty()) return false;
+  // Of several that are overdue it is the last one's: the others had their time.
+  const auto shutter = turn();
+  (shutter->overdue ? _shutters.back() : *shutter).remark = text;
   return true;
 }
 

@@ -106,8 +106,8 @@ class Shots {
   // The camera that was fired, or the only one, has gone: what was received from it may still come whole, what it was
   // to send will not.
   void unplugged(const std::string& reason, Time now);
-  // Notes what the helper logged for what it does now: the transfer, else the shutter that waits. False when there is
-  // neither.
+  // Notes what the helper logged for what it does now: the transfer, unless its failure has been told, else the shutter
+  // that waits. False when there is neither.
   bool remark(const std::string& text);
   // Nothing that is under way will come any more.
   void giveUp(const std::string& reason, Time now);

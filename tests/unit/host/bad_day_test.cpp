@@ -204,10 +204,11 @@ TEST(BadDayTest, Watch) {
        {"a.jpg was not received: its transfer broke off\ntether: 1 picture did not come\n"},
        {"b.jpg"}},
       {"a picture that only the log tells of",
-       "connectDevice: ok; rmdir; log Could not create a file; after 500 exit 1\n---\nconnectDevice: ok; picture b.jpg",
+       "connectDevice: ok; rmdir; log No file; after 500 log Writing a.jpg failed; after 510 announce a.jpg; "
+       "after 1900 exit 1\n---\nconnectDevice: ok; picture b.jpg",
        "--count 1",
        4,
-       {"a picture was not received: Could not create a file; its temporary folder /"},
+       {"a picture was not received: No file; its temporary folder /", "tether: 2 pictures did not come"},
        {"b.jpg"}},
       {"unplugged in mid-transfer",
        "connectDevice: ok; announce a.jpg; remove 257; after 100 break; after 800 add 258 Cam | ok; picture b.jpg",
