@@ -263,7 +263,7 @@ std::string Pictures::status() const {
   return picture->name + " " + sizeText(picture->size) + " receiving " + secondsText(Clock::now() - picture->announced);
 }
 
-int Pictures::finish(const Failure& failure) {
+int Pictures::finish(Failure& failure) {
   _link.finishing();
   if (failure.status == kInterrupted || failure.status == kUnwritable) waitBriefly();
   _link.finishing();
@@ -274,7 +274,14 @@ int Pictures::finish(const Failure& failure) {
   waitForDisk();
   _link.tidy(_left);
   const Shots::Counts& counts = _shots.counts();
-  if (counts.own.notSaved + counts.others.notSaved > 0) return kNotSaved;
+  const int notSaved = counts.own.notSaved + counts.others.notSaved;
+  const auto add = [&](int count, const std::string& what) {
+    if (count == 0) return;
+    failure.text += (failure.text.empty() ? "" : "; ") + countText(static_cast<std::size_t>(count), "picture") + what;
+  };
+  add(notSaved, " could not be saved");
+  add(counts.others.missing, _sendsShutters ? " of others did not come" : " did not come");
+  if (notSaved > 0) return kNotSaved;
   if (failure.status == kHelperLost || failure.status == kNoCamera) return failure.status;
   return counts.own.missing + counts.others.missing > 0 ? kTimeout : failure.status;
 }

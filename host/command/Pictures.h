@@ -37,8 +37,9 @@ class Pictures {
 
   // The end, once and whatever the reason: waits briefly for what is under way where the user asked for the end, ends
   // the helper, waits for the disk, and says what is missing. Returns the worst that happened as an exit status, which
-  // is `failure`'s where pictures tell nothing worse.
-  int finish(const Failure& failure);
+  // is `failure`'s where pictures tell nothing worse. Its text is added how many could not be saved, and how many of
+  // others did not come.
+  int finish(Failure& failure);
 
   // Whether nothing is awaited any more, and everything that was shot until now has come.
   bool isSettled() const;
@@ -54,9 +55,9 @@ class Pictures {
   void takeSaved();
   void takeLeftovers();
   void takeLog(const std::string& line);
-  void tellNotices();
   void giveLog(const Picture& picture);
   void tellStrays(Clock::time_point until);
+  void tellNotices();
   void unplugged(const DeviceRemoved& removed);
   std::string troubleInDirectory() const;
   void waitBriefly();
@@ -72,13 +73,13 @@ class Pictures {
   Shots _shots;
   std::map<int, Picture> _saving;
   std::set<std::string> _left;  // paths of what could not be saved
-  Clock::time_point _handled = Clock::now();
   struct Stray {
     std::string line;
     std::string trouble;
     Clock::time_point since;
   };
   std::deque<Stray> _strays;  // of the helper's log, on pictures that have not been announced
+  Clock::time_point _handled = Clock::now();
 };
 
 }  // namespace tether::command

@@ -35,12 +35,7 @@ class Watch {
     Outcome outcome;
     outcome.status = _pictures.finish(end);
     outcome.error = end.text;
-    const Shots::Counts& counts = _pictures.shots().counts();
-    if (counts.others.missing > 0) {
-      outcome.error += (end.text.empty() ? "" : "; ") +
-                       countText(static_cast<std::size_t>(counts.others.missing), "picture") + " did not come";
-    }
-    outcome.details = countsJson(counts);
+    outcome.details = countsJson(_pictures.shots().counts());
     if (outcome.status == kSuccess && _console.closed()) outcome.status = kUnwritable;
     return outcome;
   }
