@@ -4,6 +4,8 @@
 
 #include <algorithm>
 
+#include "Log.h"
+
 namespace tether {
 namespace {
 
@@ -71,18 +73,21 @@ void Incoming::read(int pipe) {
 
 void Incoming::keep(Message message) {
   const std::size_t memory = memoryOf(message);
+  const bool fits = memory <= kMostMemory;
+  if (!fits) platform::log("Dropped a message that takes %zu bytes of memory", memory);
   {
     const platform::Guard guard(_lock);
     _heard = Clock::now();
+    if (!fits) return;
     const bool beat = message.id == 0 && message.name == kMessageHeartbeat;
     _beatOnce = _beatOnce || beat;
     // Heartbeats that nobody takes say no more than the last of them.
     if (beat && !_messages.empty() && _messages.back().name == kMessageHeartbeat && _messages.back().id == 0) return;
     _full = true;
-    while (!_stops && !_processEnded && _memory >= kMostMemory) _changed.wait(_lock);
+    while (!_stops && !_processEnded && _memory + memory > kMostMemory) _changed.wait(_lock);
     _full = false;
     _heard = Clock::now();
-    if (_stops || _memory >= kMostMemory + kMostBehindTheEnd) return;
+    if (_stops || _memory + memory > kMostMemory + kMostBehindTheEnd) return;
   }
   if (_seen) _seen(message);
   {
