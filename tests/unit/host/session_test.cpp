@@ -250,13 +250,6 @@ TEST_F(SessionTest, AnInterruptionEndsAWaitAndLeavesTheSessionUsable) {
   EXPECT_EQ(running.request("ask", nullptr, soon()).kind, Reply::Kind::kOk);
 }
 
-TEST_F(SessionTest, AHelperThatCannotBeStartedIsSaidWithItsPath) {
-  SessionOptions options;
-  options.helper = "/no/such/helper";
-  EXPECT_THAT([&] { const Session none(options); },
-              testing::ThrowsMessage<HelperNotStarted>(HasSubstr("/no/such/helper")));
-}
-
 TEST_F(SessionTest, TheHelperInheritsNoPipeOfOurs) {
   start(R"({"on": {"shutdown": [[]]}})");
   SessionOptions options;
