@@ -7,7 +7,7 @@
 #include "KtLuaTableMarshalling.h"
 #include "KtNSDataStreamBuf.h"
 
-using fuzz::check;
+using testkit::check;
 using Element = std::unique_ptr<KtLuaTE>;
 
 namespace {

@@ -14,7 +14,7 @@
 #include "KtRCMessageAccumulator.h"
 #include "Log.h"
 
-using fuzz::check;
+using testkit::check;
 
 // A friend of the reader.
 struct KtRCMessageAccumulatorTest {

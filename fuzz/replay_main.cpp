@@ -1,5 +1,5 @@
-// Runs a fuzz target without a fuzzer: every file named, or in a folder named, and then `--runs N` changed ones of
-// them, the same for the same `--seed S`.
+// Runs a fuzz target without a fuzzer: the file named, or those in a folder named, and then so many changed ones of
+// them, the same for the same seed.
 #include <algorithm>
 #include <csignal>
 #include <cstdint>
@@ -7,13 +7,13 @@
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
-#include <fstream>
-#include <iterator>
 #include <memory>
 #include <random>
 #include <set>
 #include <string>
 #include <vector>
+
+#include "Files.h"
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* bytes, size_t count);
 
@@ -67,39 +67,28 @@ void change(Bytes& bytes, const Bytes& other, std::mt19937_64& random) {
 }  // namespace
 
 int main(int argc, char** argv) {
-  std::signal(SIGABRT, tellWhatRan);
-  std::signal(SIGSEGV, tellWhatRan);
-  std::set<fs::path> files;
-  unsigned long runs = 0;
-  unsigned long seed = 1;
-  for (int index = 1; index < argc; ++index) {
-    const std::string argument = argv[index];
-    if ((argument == "--runs" || argument == "--seed") && index + 1 < argc) {
-      (argument == "--runs" ? runs : seed) = std::strtoul(argv[++index], nullptr, 10);
-    } else if (fs::is_directory(argument)) {
-      files.insert(fs::directory_iterator(argument), fs::directory_iterator());
-    } else {
-      files.insert(argument);
-    }
-  }
-  std::vector<Bytes> corpus;
-  for (const fs::path& path : files) {
-    std::ifstream file(path, std::ios::binary);
-    corpus.emplace_back(std::istreambuf_iterator<char>(file), std::istreambuf_iterator<char>());
-    run(corpus.back(), path.string());
-  }
-  if (corpus.empty()) {
-    std::fprintf(stderr, "usage: %s FILE_OR_FOLDER... [--runs N] [--seed S]\n", argv[0]);
+  if (argc != 4) {
+    std::fprintf(stderr, "usage: %s FILE_OR_FOLDER RUNS SEED\n", argv[0]);
     return 2;
   }
-  std::mt19937_64 random(seed);
+  std::signal(SIGABRT, tellWhatRan);
+  std::signal(SIGSEGV, tellWhatRan);
+  std::set<fs::path> files{argv[1]};
+  if (fs::is_directory(argv[1])) files = {fs::directory_iterator(argv[1]), fs::directory_iterator()};
+  std::vector<Bytes> corpus;
+  for (const fs::path& path : files) {
+    corpus.push_back(testkit::readFile<Bytes>(path));
+    run(corpus.back(), path.string());
+  }
+  std::mt19937_64 random(std::strtoul(argv[3], nullptr, 10));
+  const unsigned long runs = std::strtoul(argv[2], nullptr, 10);
   for (unsigned long number = 1; number <= runs; ++number) {
     Bytes bytes = corpus[random() % corpus.size()];
     for (auto changes = 1 + random() % 8; changes > 0; --changes) {
       change(bytes, corpus[random() % corpus.size()], random);
     }
     bytes.resize(std::min(bytes.size(), kLongestInput));
-    run(bytes, "run " + std::to_string(number) + " of seed " + std::to_string(seed));
+    run(bytes, "run " + std::to_string(number));
   }
   std::printf("%zu files and %lu changed ones\n", corpus.size(), runs);
   return 0;

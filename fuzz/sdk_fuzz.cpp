@@ -13,16 +13,16 @@
 
 #include "ContentContainer.h"
 #include "ContentData.h"
-#include "FuzzedModule.h"
+#include "FaultyModule.h"
 #include "HostMessages.h"
 #include "KtNSDataStreamBuf.h"
 #include "Log.h"
 #include "NikonModule.h"
 #include "NikonTetherService.h"
 
-using fuzz::check;
-using fuzz::FuzzedModule;
-using fuzz::Input;
+using testkit::check;
+using testkit::Deed;
+using testkit::Input;
 namespace fs = std::filesystem;
 
 namespace {
@@ -40,6 +40,86 @@ constexpr std::int32_t kCapabilities[] = {
     kNkMAIDCapability_WBMode,       kNkMAIDCapability_SaveMedia,    kNkMAIDCapability_Children};
 
 std::map<double, double> announcedSizes;  // by capture id
+
+// A module whose answers the input of a run changes. After some polls it answers no more of them, so that no wait goes
+// on for ever.
+class FuzzedModule {
+ public:
+  explicit FuzzedModule(Input& input) : _input(input), _talksAtAnyTime(input.onceIn(2)) {
+    for (const std::uint32_t id : {1, 2}) {
+      auto& camera = _module.model.addCamera(id, "Fuzzed");
+      camera.setTransfer({.deliveryBytes = 256U + _input.word(), .deliveriesPerPoll = 8});
+      for (const std::uint32_t type : {1, 4})
+        camera.shoot(virtualcamera::patternPicture(type + _input.byte(), _input.number()));
+    }
+    // What the record of an enumeration was changed to is filled, and what that of a delivery was is readable.
+    _module.model.faults().add({.command = kNkMAIDCommand_CapGetArray, .anyArraySize = true});
+    const auto edit = [this](tagNkMAIDFileInfo& info) {
+      if (_input.onceIn(8)) testkit::FaultyModule::scribble(_input, info);
+    };
+    _module.model.faults().add({.command = kNkMAIDCommand_CapStart, .delivery = {.count = UINT32_MAX, .edit = edit}});
+  }
+
+ private:
+  static constexpr int kMostCalls = 200000;
+  static constexpr int kMostPolls = 16;
+  static constexpr int kDeepestCallback = 3;
+
+  Deed decide(const virtualcamera::Call& call) {
+    check(++_calls < kMostCalls, "a run comes to its end");
+    const bool polls = call.command == kNkMAIDCommand_Async;
+    if (polls && ++_polls > kMostPolls) return {.done = false, .answer = kNkMAIDResult_HardwareError};
+    Deed deed;
+    const bool fails = call.command != kNkMAIDCommand_Close && _input.onceIn(polls ? 32 : 12);
+    // An object is open where the caller is told so, and nowhere else.
+    if (fails) deed.answer = call.command == kNkMAIDCommand_Open ? -1 - _input.byte() : result();
+    if (fails) deed.done = call.command != kNkMAIDCommand_Open && _input.onceIn(2);
+    // Events are the input's alone. A new picture of a camera goes to another thread, where no run is like the other.
+    if (call.command == kNkMAIDCommand_CapSet && call.parameter == kNkMAIDCapability_EventProc) deed.done = false;
+    if (deed.done && _input.onceIn(4)) deed.nonsense = &_input;
+    if (polls || _talksAtAnyTime) {
+      deed.after = [this] {
+        for (int left = _input.byte() & 3; left > 0; --left) talk();
+      };
+    }
+    return deed;
+  }
+
+  std::int32_t result() { return _input.onceIn(4) ? static_cast<std::int32_t>(_input.dword()) : 0 - _input.byte(); }
+
+  // A callback at a time of its own: a completion, an event or a piece of a file; of closed objects too.
+  void talk() {
+    const std::uint8_t kind = _input.byte();
+    if (_depth >= kDeepestCallback) return;
+    ++_depth;
+    const auto all = _module.callbacks();
+    const auto oneOf = [this](const auto& list) { return list[_input.byte() % list.size()]; };
+    if (kind >= 170 && !all.completions.empty()) {
+      oneOf(all.completions)(result());
+    } else if (kind >= 85 && !all.events.empty()) {
+      const auto target = oneOf(all.events);
+      const std::uint32_t event = _input.onceIn(4) ? _input.number() : _input.byte() % 8;
+      if (target.level != virtualcamera::Level::Camera || event != kNkMAIDEvent_AddChild)
+        target.event(event, _input.number());
+    } else if (!all.deliveries.empty()) {
+      const auto target = oneOf(all.deliveries);
+      tagNkMAIDFileInfo info{kNkMAIDDataObjType_File | kNkMAIDDataObjType_Image, _input.byte(), _input.number(),
+                             _input.number(), _input.number()};
+      // As many bytes as the record says, or none.
+      std::vector<std::uint8_t> bytes(info.ulLength <= UINT16_MAX ? info.ulLength : 0);
+      target.deliver(_input.onceIn(32) ? nullptr : &info, bytes.empty() ? nullptr : bytes.data());
+    }
+    --_depth;
+  }
+
+  Input& _input;
+  testkit::FaultyModule _module{[this](const auto& call) { return decide(call); },
+                                [](const char* promise) { check(false, promise); }};
+  const bool _talksAtAnyTime;
+  int _polls = 0;
+  int _calls = 0;
+  int _depth = 0;  // callbacks inside each other
+};
 
 double numberIn(const KtLuaTETable& table, const char* key) {
   KtLuaTE* const value = table.elementForKey(key);
@@ -67,20 +147,13 @@ const fs::path& pictureFolder() {
   return *folder;
 }
 
-class FileSizeLimit {
- public:
-  FileSizeLimit() {
-    getrlimit(RLIMIT_FSIZE, &_before);
-    const rlimit limit{kLargestFile, _before.rlim_max};
-    setrlimit(RLIMIT_FSIZE, &limit);
-  }
-  FileSizeLimit(const FileSizeLimit&) = delete;
-  FileSizeLimit& operator=(const FileSizeLimit&) = delete;
-  ~FileSizeLimit() { setrlimit(RLIMIT_FSIZE, &_before); }
-
- private:
-  rlimit _before{};
-};
+// The fuzzer writes files too.
+void limitFiles(rlim_t most) {
+  rlimit limit{};
+  getrlimit(RLIMIT_FSIZE, &limit);
+  limit.rlim_cur = most;
+  setrlimit(RLIMIT_FSIZE, &limit);
+}
 
 void readEverything(CNikonObject& object) {
   object.debugDumpCapabilities();
@@ -132,7 +205,7 @@ void useCamera(CNikonModule& module, std::int32_t id) {
 }
 
 void useModule() {
-  CNikonModule module(FuzzedModule::entryPoint, "Fuzzed", kModuleId);
+  CNikonModule module(testkit::FaultyModule::entryPoint, "Fuzzed", kModuleId);
   readEverything(module);
   module.enumChildren();
   module.doInitialCameraScan();
@@ -181,8 +254,8 @@ const char* __tsan_default_options() { return OPTIONS; }
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* bytes, size_t count) {
   const fs::path& folder = pictureFolder();
   Input input(bytes, count);
+  limitFiles(kLargestFile);
   {
-    const FileSizeLimit limit;
     FuzzedModule module(input);
     try {
       useModule();
@@ -190,6 +263,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* bytes, size_t count) {
       // It could not be opened.
     }
   }
+  limitFiles(RLIM_INFINITY);
   announcedSizes.clear();
   gDownloadIdToNameMap.clear();
   for (const auto& file : fs::directory_iterator(folder)) fs::remove(file.path());

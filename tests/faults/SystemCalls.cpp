@@ -1,10 +1,8 @@
-// The calls of the system that the product makes for a picture's file, on their way through the lying module. A way
-// other than kRefused has the call half done, or fail with what must not be the end.
+// The calls of the system that the product makes for a picture's file, on their way past the road. kRefused is a disk,
+// memory or process table that is full; every other way has the call half done, or fail with what must not be the end.
 
 #include <fcntl.h>
-#include <stdlib.h>
 #include <sys/mman.h>
-#include <unistd.h>
 
 #include <cerrno>
 #include <cstdarg>
@@ -13,7 +11,7 @@
 #include <system_error>
 #include <thread>
 
-#include "LyingModule.h"
+#include "Road.h"
 
 namespace {
 
@@ -21,13 +19,7 @@ namespace {
 constexpr std::size_t kLargestBlock = 256 << 20;
 
 std::optional<Way> wayOf(SystemCall which, bool concerned = true) {
-  return concerned && lyingModule() != nullptr ? lyingModule()->systemCall(which) : std::nullopt;
-}
-
-bool noMemory(std::size_t size) {
-  if (size < kLargeBlock) return false;
-  errno = ENOMEM;
-  return wayOf(kMemory) || size > kLargestBlock;
+  return concerned && currentRoad() != nullptr ? currentRoad()->systemCall(which) : std::nullopt;
 }
 
 }  // namespace
@@ -37,10 +29,8 @@ extern "C" {
 int __real_open(const char* path, int flags, ...);
 std::FILE* __real_fdopen(int descriptor, const char* mode);
 std::size_t __real_fwrite(const void* bytes, std::size_t size, std::size_t count, std::FILE* file);
-ssize_t __real_write(int descriptor, const void* bytes, std::size_t count);
 int __real_fclose(std::FILE* file);
-void* __real_calloc(std::size_t count, std::size_t size);
-void* __real_malloc(std::size_t size);
+int __real_fallocate(int file, int mode, off_t offset, off_t size);
 void* __real_mmap(void* address, std::size_t size, int protection, int flags, int descriptor, off_t offset);
 
 int __wrap_open(const char* path, int flags, ...) {
@@ -50,7 +40,7 @@ int __wrap_open(const char* path, int flags, ...) {
   va_end(rest);
   const auto way = wayOf(kOpen, (flags & O_EXCL) != 0);
   if (!way) return __real_open(path, flags, mode);
-  errno = *way == kRefused ? EACCES : EEXIST;
+  errno = *way == kRefused ? EACCES : *way == kBusy ? EEXIST : EINTR;
   return -1;
 }
 
@@ -63,15 +53,9 @@ std::FILE* __wrap_fdopen(int descriptor, const char* mode) {
 std::size_t __wrap_fwrite(const void* bytes, std::size_t size, std::size_t count, std::FILE* file) {
   const auto way = wayOf(kFwrite, size * count >= kLargeBlock);
   if (!way) return __real_fwrite(bytes, size, count, file);
-  errno = ENOSPC;
-  return *way == kRefused ? 0 : __real_fwrite(bytes, size, count / 2, file);
-}
-
-ssize_t __wrap_write(int descriptor, const void* bytes, std::size_t count) {
-  const auto way = wayOf(kWrite, count >= kLargeBlock);
-  if (!way) return __real_write(descriptor, bytes, count);
-  errno = ENOSPC;
-  return *way == kRefused ? -1 : __real_write(descriptor, bytes, count / 2);
+  const std::size_t written = *way == kRefused ? 0 : __real_fwrite(bytes, size, count / 2, file);
+  errno = *way == kBufferSize ? EINTR : ENOSPC;
+  return written;
 }
 
 int __wrap_fclose(std::FILE* file) {
@@ -82,14 +66,18 @@ int __wrap_fclose(std::FILE* file) {
   return EOF;
 }
 
-void* __wrap_calloc(std::size_t count, std::size_t size) {
-  return noMemory(count * size) ? nullptr : __real_calloc(count, size);
+int __wrap_fallocate(int file, int mode, off_t offset, off_t size) {
+  const auto way = wayOf(kReserve);
+  if (!way) return __real_fallocate(file, mode, offset, size);
+  errno = *way == kRefused ? ENOSPC : *way == kBusy ? EOPNOTSUPP : EINTR;
+  return -1;
 }
 
-void* __wrap_malloc(std::size_t size) { return noMemory(size) ? nullptr : __real_malloc(size); }
-
 void* __wrap_mmap(void* address, std::size_t size, int protection, int flags, int descriptor, off_t offset) {
-  return noMemory(size) ? MAP_FAILED : __real_mmap(address, size, protection, flags, descriptor, offset);
+  const bool fails = size >= kLargeBlock && (wayOf(kMemory) || size > kLargestBlock);
+  if (!fails) return __real_mmap(address, size, protection, flags, descriptor, offset);
+  errno = ENOMEM;
+  return MAP_FAILED;
 }
 
 // std::thread's start, under the name that the linker knows it by.

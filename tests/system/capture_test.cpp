@@ -15,8 +15,8 @@ class Capture : public HelperTest {
  protected:
   void shoot() { helper.send(request("doCapture", 2)); }
   void expectPicture(const std::string& bytes, const std::string& name, double id, double sidecar = 0) {
-    const Message& added = helper.await("objectWasAdded");
-    const Message& complete = helper.await("fileDownloadComplete");
+    const Received& added = helper.await("objectWasAdded");
+    const Received& complete = helper.await("fileDownloadComplete");
     EXPECT_LT(added.place, complete.place);
     EXPECT_TRUE(added.id == 0 && complete.id == 0);
     EXPECT_TRUE(added.entries() == 4 && complete.entries() == 2);
@@ -44,7 +44,7 @@ TEST_F(Capture, IsAnnouncedThenCompleteUnderNumbersThatGoOnAndAPairSharesABaseNa
   drop(studio() / "roll/2.nef", raw);
   drop(studio() / "roll/3.ndf", jpeg);
   startWithCamera();
-  connect(kStudio);
+  connect();
   shoot();
   expectPicture(tiny, "Capture0001.tif", 1);
   shoot();
@@ -63,7 +63,7 @@ TEST_F(Capture, WorksWithoutAFolderOfCameras) {
   helper.install("Type0001Module", VIRTUAL_CAMERA_MODULE);
   helper.start();
   EXPECT_EQ(helper.await("deviceAdded").text("name"), "Virtual Camera");
-  connect(kStudio);
+  connect();
   shoot();
   const std::string jpeg = readFile(helper.await("fileDownloadComplete").text("file_path"));
   EXPECT_EQ(static_cast<double>(jpeg.size()), helper.await("objectWasAdded").number("file_size"));
@@ -71,7 +71,7 @@ TEST_F(Capture, WorksWithoutAFolderOfCameras) {
 }
 
 TEST_F(Capture, ALimitOnFileSizesCostsThePicturesAboveItOnly) {
-  helper.limitFileSize(500'000);
+  helper.limit("-f 1000");
   startWithCamera();
   // What is known to be too large before it begins is not announced.
   drop(studio() / "0.jpg", pattern(2'000'000, 3));

@@ -32,7 +32,7 @@ TEST_F(Plug, EveryCameraIsAnnouncedOnceWhenItComesAndOnceWhenItGoes) {
   // Ids that do not fit are no cameras.
   for (const char* name : {"0-None", "256-Far", "257-Farther"}) fs::create_directories(helper.cameras() / name);
   startWithCamera();
-  connect(kStudio);
+  connect();
   plugIn("2-Field");
   expectNext("deviceAdded", kField);
   helper.send(request("listDevices", 2));
@@ -47,7 +47,7 @@ TEST_F(Plug, EveryCameraIsAnnouncedOnceWhenItComesAndOnceWhenItGoes) {
   plugIn("1-Studio");
   expectNext("deviceAdded", kStudio);
   expectNoCameraConnected(5);
-  connect(kStudio);
+  connect();
   EXPECT_EQ(helper.count("deviceAdded"), 3U);
   EXPECT_EQ(helper.count("deviceRemoved"), 2U);
 }
@@ -58,7 +58,7 @@ TEST_F(Plug, ComingAndGoingLeavesNoDescriptorAndNoThreadBehind) {
   std::ptrdiff_t descriptors = 0;
   std::ptrdiff_t threads = 0;
   for (int round = 0; round < 10; ++round) {
-    connect(kStudio);
+    connect();
     helper.send(request("doCapture", 2));
     helper.await("fileDownloadComplete");
     unplug("1-Studio");

@@ -16,18 +16,18 @@ class Requests : public HelperTest {
   // Nothing but these messages, besides heartbeats, since the start.
   void expectOnly(const std::vector<std::string>& names) {
     std::vector<std::string> seen;
-    for (const Message& message : helper.messages()) {
+    for (const Received& message : helper.messages()) {
       if (message.name != "heartbeat" && message.id < 1'000'000) seen.push_back(message.name);
     }
     EXPECT_EQ(seen, names);
   }
 };
 
-void expectSettings(const Message& message) {
+void expectSettings(const Received& message) {
   EXPECT_EQ(message.entries(), 7U);
   EXPECT_EQ(message.number("isoSpeed"), 400);
   EXPECT_EQ(message.number("batteryLevel"), 85);
-  EXPECT_TRUE(message.isNil("availableShots"));
+  EXPECT_EQ(message.value("availableShots")->getType(), kKtLuaTypeNil);
   EXPECT_EQ(message.text("aeMode"), "Manual");
   EXPECT_EQ(message.text("aperture"), "f/5.6");
   EXPECT_EQ(message.text("shutter"), "1/125");
@@ -39,9 +39,9 @@ TEST_F(Requests, ConnectingAnswersByteForByteAndIsFollowedByAllSettings) {
   helper.send(
       "\x40\0\0\0\x07\0\0\0\x03\0\0\0\x0e\0\0\0connectDevice\0\x05\0\0\0\x01\0\0\0"
       "\x03\0\0\0\x0a\0\0\0device_id\0\x02\0\0\0\0\0\0\0\0\x10\x70\x40"s);
-  const Message& ok = helper.await("ok");
+  const Received& ok = helper.await("ok");
   EXPECT_EQ(ok.bytes, "\x13\0\0\0\x07\0\0\0\x03\0\0\0\x03\0\0\0ok\0\x01\0\0\0"s);
-  const Message& changed = helper.await("cameraSettingsChanged");
+  const Received& changed = helper.await("cameraSettingsChanged");
   EXPECT_EQ(changed.id, 0);
   EXPECT_GT(changed.place, ok.place);
   expectSettings(changed);
@@ -53,7 +53,7 @@ TEST_F(Requests, ConnectingAnswersByteForByteAndIsFollowedByAllSettings) {
   helper.send(request("disconnectDevice", 6, 0x1102) + request("getCameraSettings", 10, kStudio) +
               request("disconnectDevice", 7, 0x0102) + request("getCameraSettings", 11, kStudio));
   EXPECT_EQ(helper.awaitAnswer(10).name, "ok");
-  const Message& error = helper.awaitAnswer(11);
+  const Received& error = helper.awaitAnswer(11);
   EXPECT_EQ(error.entries(), 2U);
   EXPECT_EQ(error.number("error_code"), 65535);
   EXPECT_EQ(error.text("error_description"), "No camera is connected");

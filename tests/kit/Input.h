@@ -1,4 +1,4 @@
-// What the targets share: the rules they check, and the bytes of a run as numbers.
+// Rules that hold for every input, and the bytes of a run as numbers.
 #pragma once
 
 #include <algorithm>
@@ -8,7 +8,7 @@
 #include <cstdlib>
 #include <cstring>
 
-namespace fuzz {
+namespace testkit {
 
 // A rule that holds for every input. One that does not ends the program, which is a finding.
 inline void check(bool holds, const char* rule) {
@@ -50,4 +50,4 @@ class Input {
   std::size_t _left;
 };
 
-}  // namespace fuzz
+}  // namespace testkit
