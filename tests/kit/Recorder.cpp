@@ -84,6 +84,12 @@ Message Recorder::await(const std::string& name, std::size_t n) {
   return found;
 }
 
+std::size_t Recorder::count(const std::string& name) {
+  const std::lock_guard guard(_lock);
+  return static_cast<std::size_t>(std::count_if(_messages.begin(), _messages.end(),
+                                                [&](const Message& message) { return message.name == name; }));
+}
+
 void Recorder::forgetMessages() {
   const std::lock_guard guard(_lock);
   _messages.clear();

@@ -32,6 +32,7 @@ class Recorder {
   std::string names();
   // The n-th message of that name, waited for.
   Message await(const std::string& name, std::size_t n = 1);
+  std::size_t count(const std::string& name);
   void forgetMessages();
 
   std::size_t traced(const std::string& part);

@@ -53,17 +53,6 @@ std::string keysOf(const KtLuaTETable& table) {
   return keys;
 }
 
-// Reports its own end.
-class Watched : public KtLuaTE {
- public:
-  Watched(std::int32_t kind, int& alive) : KtLuaTE(kind), _alive(alive) { ++_alive; }
-  ~Watched() override { --_alive; }
-  KtLuaTE* copy() override { return new Watched(getType(), _alive); }
-
- private:
-  int& _alive;
-};
-
 TEST(Elements, KeysStandInOrderOfTheirKindsThenOfValueUnsignedBytesOrIdentity) {
   KtLuaTETable table;
   for (int round = 0; round < 2; ++round) {
@@ -81,34 +70,6 @@ TEST(Elements, KeysStandInOrderOfTheirKindsThenOfValueUnsignedBytesOrIdentity) {
   EXPECT_NE(table.elementForKey(2), nullptr);
   EXPECT_EQ(table.elementForKey(3), nullptr);
   EXPECT_EQ(static_cast<std::string>(*table.elementForKey(&nil)), "") << "a number is no text";
-}
-
-TEST(Elements, SetReplacesKeyAndValueAndDestroysTheOldOnes) {
-  int alive = 0;
-  {
-    KtLuaTETable table;
-    auto* const second = new Watched(kKtLuaTypeString, alive);
-    table.Set(new Watched(kKtLuaTypeString, alive), new Watched(kKtLuaTypeNil, alive));
-    table.Set(second, new KtLuaTENumber(2));
-    EXPECT_EQ(alive, 1);
-    ASSERT_EQ(table.getEntries().size(), 1U);
-    EXPECT_EQ(table.getEntries().begin()->first, second);
-  }
-  EXPECT_EQ(alive, 0);
-}
-
-TEST(Elements, ACopySharesNothingWithItsSource) {
-  auto source = std::make_unique<KtLuaTETable>();
-  auto* inner = new KtLuaTETable;
-  inner->Set(new KtLuaTEData("\1\2\3", 3), new KtLuaTENumber(7));
-  source->Set("inner", inner);
-  source->Set(new KtLuaTENil, new KtLuaTEString("a\0b"s));
-  const std::string before = encode(*source);
-  const std::unique_ptr<KtLuaTE> copy(source->copy());
-  source.reset();
-  EXPECT_EQ(encode(*copy), before);
-  const auto& entries = dynamic_cast<KtLuaTETable&>(*copy).getEntries();
-  EXPECT_EQ(static_cast<std::string>(*entries.begin()->second).size(), 3U) << "text behind the NUL";
 }
 
 TEST(Elements, ADictionaryOfNumbersTruthValuesAndTextsIsImportedAndNothingElse) {

@@ -4,10 +4,8 @@
 
 #include <gtest/gtest.h>
 
-#include <fstream>
-#include <memory>
-#include <string>
-
+#include "FileManager.h"
+#include "Files.h"
 #include "NikonTetherService.h"
 #include "Recorder.h"
 #include "RunLoop.h"
@@ -16,27 +14,47 @@ class ServiceTest : public ::testing::Test {
  protected:
   static constexpr int kModuleId = 0x300;
 
-  ServiceTest();
-  ~ServiceTest() override;
+  ServiceTest() { setenv("TMPDIR", temporary.path().c_str(), 1); }
+  ~ServiceTest() override {
+    service.reset();
+    EXPECT_EQ(model.openObjects(), 0U);
+  }
 
   // Makes the service and announces the cameras, as the task does at start-up.
-  void start();
-  // Idle passes until the n-th message of that name has come.
-  Message idleUntil(const std::string& name, std::size_t n = 1);
-  void idleUntil(const std::function<bool()>& condition);
+  void start() {
+    service.reset(NikonTetherService::getSingleton());
+    service->doInitialCameraScan();
+  }
   void idle() { service->idle(); }
+  void idleUntil(const std::function<bool()>& condition) {
+    while (!condition()) {
+      idle();
+      std::this_thread::yield();
+    }
+  }
+  // Idle passes until the n-th message of that name has come.
+  Message idleUntil(const std::string& name, std::size_t n = 1) {
+    idleUntil([&] { return recorder.count(name) >= n; });
+    return recorder.await(name, n);
+  }
 
   // A request's payload with this device id.
-  static std::unique_ptr<KtLuaTETable> device(double deviceId);
+  static std::unique_ptr<KtLuaTETable> device(double deviceId) {
+    auto table = std::make_unique<KtLuaTETable>();
+    table->Set("device_id", new KtLuaTENumber(deviceId));
+    return table;
+  }
   void connect(int messageId, int cameraId) { service->connectDevice(messageId, device(kModuleId | cameraId).get()); }
   void askSettings(int messageId, double deviceId) { service->getCameraSettings(messageId, device(deviceId).get()); }
 
-  static std::vector<std::uint8_t> bytes(std::size_t size, int seed = 1);
-  static std::vector<std::uint8_t> read(const std::string& path);
-  std::vector<std::string> files() const;
+  using Bytes = std::vector<std::uint8_t>;
+  static Bytes bytes(std::size_t size, int seed = 1) { return testkit::bytes(size, static_cast<unsigned>(seed)); }
+  static Bytes read(const std::string& path) { return testkit::readFile<Bytes>(path); }
+  std::vector<std::string> files() const { return platform::FileManager::contents(folder); }
 
   Recorder recorder;
-  std::string folder;  // the temporary directory
+  const testkit::Folder temporary;
+  const std::string folder = temporary.path();
   virtualcamera::Model model;
   std::unique_ptr<NikonTetherService> service;
 };

@@ -2,6 +2,7 @@
 
 #include <future>
 
+#include "CompletionRecords.h"
 #include "ContentContainer.h"
 #include "NikonThreadedObject.h"
 #include "ServiceTest.h"
@@ -43,6 +44,11 @@ class DownloadThreadTest : public ServiceTest {
       thread = std::this_thread::get_id();
       lastEvent = event;
     }
+    void completionCallback_thread(std::int32_t command, std::int32_t result, void* context) override {
+      thread = std::this_thread::get_id();
+      lastEvent = command + result;
+      EXPECT_EQ(context, this);
+    }
     void* reference() { return static_cast<CNikonCallbackReceiver*>(this); }
     std::thread::id thread;
     std::int32_t lastEvent = -1;
@@ -66,6 +72,13 @@ TEST_F(DownloadThreadTest, CallbacksAreCarriedToItOnceTheObjectBelongsToIt) {
   MAIDEventHandler(object->reference(), 4, 0);
   EXPECT_EQ(object->lastEvent, 4);
   EXPECT_EQ(recorder.traced("Event Notification"), 0U);
+  object->thread = {};
+  std::atomic<std::uint32_t> counter{0};
+  CommandCompletionProc(nullptr, kNkMAIDCommand_CapStart, 0, 0, 0, addCompletionRecord({object, object, &counter}),
+                        100);
+  EXPECT_EQ(object->lastEvent, kNkMAIDCommand_CapStart + 100);
+  EXPECT_TRUE(object->thread != std::thread::id() && object->thread != std::this_thread::get_id());
+  EXPECT_EQ(counter, 1U);
   loop->perform([&] { EXPECT_EQ(MAIDDataHandler(object->reference(), nullptr, nullptr), 5); });
   // It may be in a call into a module that waits for the callback.
   loop->perform([&] { std::async(std::launch::async, [&] { MAIDEventHandler(object->reference(), 6, 0); }).get(); });
@@ -106,23 +119,6 @@ TEST_F(DownloadThreadTest, AnItemIsDeletedWithItsWrapperAndAWrapperEmptiedWithIt
   delete device;
   EXPECT_EQ(wrapper->contentContainer(), nullptr);
   loop->perform([&] { downloads.addToDownloadQueue(wrapper); });  // skipped
-}
-
-TEST_F(ServiceTest, ItemsAreTransferredInTheOrderOfTheirQueueing) {
-  auto& camera = model.addCamera(1, "One");
-  camera.setTransfer({.deliveryBytes = 100});
-  start();
-  for (std::size_t size = 1; size <= 40; ++size) camera.shoot(Picture::jpeg(bytes(size * 10)));
-  idleUntil("fileDownloadComplete", 40);
-  std::vector<double> sizes;
-  std::string order;
-  for (const Message& message : recorder.messages()) {
-    if (message.name == "objectWasAdded") sizes.push_back(message.numbers.at("file_size"));
-    if (message.name != "deviceAdded") order += message.name[0];
-  }
-  EXPECT_TRUE(std::is_sorted(sizes.begin(), sizes.end()));
-  EXPECT_EQ(order.find("oo"), std::string::npos) << "a file began before the one before it was complete";
-  EXPECT_NE(recorder.await("objectWasAdded").thread, std::this_thread::get_id());
 }
 
 TEST_F(ServiceTest, ACameraThatGoesWithItemsQueuedAndOneThatNeverCompletesLeavesNothingBehind) {
@@ -200,25 +196,6 @@ TEST_F(ServiceTest, DeliveriesArriveWholeWhicheverThreadBringsThem) {
     const Message complete = recorder.await("fileDownloadComplete", n);
     EXPECT_EQ(read(complete.strings.at("file_path")), bytes(995, static_cast<int>(n)));
   }
-}
-
-// Opened by the download thread, which then waits for what the others carry to it.
-TEST_F(ServiceTest, DeliveriesOnOtherThreadsReachADataObjectThatOpenedLate) {
-  auto& camera = model.addCamera(1, "One");
-  camera.setTransfer({.deliveryBytes = 100, .inModulePolls = true});
-  for (unsigned item = 1; item <= 40; ++item) {
-    model.faults().add({.level = Level::Data,
-                        .item = item,
-                        .command = kNkMAIDCommand_Open,
-                        .times = 1,
-                        .answer = kNkMAIDResult_HardwareError});
-    if (item % 2 == 0)
-      model.faults().add({.level = Level::Data, .item = item, .command = kNkMAIDCommand_CapStart, .ownThread = true});
-  }
-  start();
-  for (int shot = 0; shot < 40; ++shot) camera.shoot(Picture::jpeg(bytes(995, shot)));
-  idleUntil("fileDownloadComplete", 40);
-  EXPECT_EQ(read(recorder.await("fileDownloadComplete", 40).strings.at("file_path")), bytes(995, 39));
 }
 
 // A module may take seconds for a poll: on the main thread, while a picture comes in on the other; then there.

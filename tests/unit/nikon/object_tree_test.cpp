@@ -48,6 +48,23 @@ TEST_F(ObjectTree, ADeletedObjectClosesTheDeepestFirstAndLeavesItsParent) {
   EXPECT_EQ(recorder.logged("Releasing lock - ACQLOCK - for deleting CNikonObject: 0x"), 8U);
 }
 
+TEST_F(ObjectTree, ADeletionUnregistersBeforeItClosesAndHoldsTheLockForTheWholeSubtree) {
+  openAll();
+  CNikonObject* const camera = root->openChild(2, "camera");
+  std::string order;
+  model.beforeCall([&](const virtualcamera::Call& call) {
+    order += std::string(" ") + "?MCID"[static_cast<int>(call.target.level)];
+    order += call.command == kNkMAIDCommand_Close ? "-" : call.parameter == kNkMAIDCapability_EventProc ? "e" : "d";
+    EXPECT_TRUE(call.command == kNkMAIDCommand_Close || call.dataType == kNkMAIDDataType_Null);
+    std::async(std::launch::async, [] { EXPECT_FALSE(gNikonObjectLock.try_lock_for(std::chrono::seconds(0))); }).get();
+  });
+  delete camera;
+  EXPECT_EQ(order, " Ce Cd Ie Id De Dd D- I- C-");
+  model.beforeCall({});
+  ASSERT_TRUE(gNikonObjectLock.try_lock_for(std::chrono::seconds(0)));
+  gNikonObjectLock.unlock();
+}
+
 TEST_F(ObjectTree, AFailedOpenReportsTheSdkResultAndLeavesNothing) {
   root = std::make_unique<CNikonObject>(Model::entryPoint(), "module");
   EXPECT_EQ(root->openChild(5, "camera"), nullptr);
@@ -111,25 +128,6 @@ TEST_F(ObjectTree, ChildrenAreListedInTheOrderOfTheSdkAndFailuresEmptyTheList) {
   EXPECT_EQ(root->listChildren(ids), kNkMAIDResult_DeviceBusy);
   EXPECT_TRUE(ids.empty());
   EXPECT_EQ(recorder.traced("Error detected: (152) kNkMAIDResult_DeviceBusy"), 1U);
-}
-
-TEST_F(ObjectTree, ADeletionWaitsForAnotherThreadsAndSaysSoEveryThirtySeconds) {
-  root = std::make_unique<CNikonObject>(Model::entryPoint(), "module");
-  std::promise<void> held;
-  std::promise<void> release;
-  auto holder = std::async(std::launch::async, [&] {
-    const std::lock_guard guard(gNikonObjectLock);
-    held.set_value();
-    release.get_future().wait();
-  });
-  held.get_future().wait();
-  auto deleter = std::async(std::launch::async, [&] { root.reset(); });
-  EXPECT_EQ(deleter.wait_for(std::chrono::seconds(31)), std::future_status::timeout);
-  EXPECT_EQ(recorder.logged("*** COULD NOT ACQUIRE LOCK! ACQLOCK  Thread: "), 1U);
-  EXPECT_EQ(model.openObjects(), 1U);
-  release.set_value();
-  deleter.get();
-  EXPECT_EQ(model.openObjects(), 0U);
 }
 
 }  // namespace

@@ -1,8 +1,5 @@
 // How deliveries become a file, and what becomes of those that are wrong.
 
-#include <signal.h>
-#include <sys/resource.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include "ServiceTest.h"
@@ -117,27 +114,6 @@ TEST_F(PictureTest, ATransferThatIsRefusedOrBreaksOffIsOneLogLineAndNotReportedA
     EXPECT_EQ(recorder.logged(std::string("Transfer of item ") + line), 1U) << line;
   }
   EXPECT_EQ(recorder.logged("Transfer of item"), 3U);
-}
-
-TEST_F(PictureTest, AFileThatCannotBeCreatedIsNeitherAddedNorCompleteAndTheNextOneIs) {
-  start();
-  rmdir(folder.c_str());
-  camera.shoot(Picture::jpeg(bytes(30)));
-  idleUntil([&] { return recorder.logged("Could not create a file for Capture0001.jpg: ") == 1; });
-  mkdir(folder.c_str(), 0700);
-  camera.shoot(Picture::jpeg(bytes(20)));
-  idleUntil("fileDownloadComplete");
-  EXPECT_EQ(recorder.names(), "deviceAdded objectWasAdded fileDownloadComplete");
-  EXPECT_EQ(files(), (std::vector<std::string>{"Capture0002.jpg"}));
-}
-
-TEST_F(PictureTest, AShortWriteRemovesTheFileAndIsNotReportedAsComplete) {
-  signal(SIGXFSZ, SIG_IGN);
-  rlimit limit{50, RLIM_INFINITY};
-  ASSERT_EQ(setrlimit(RLIMIT_FSIZE, &limit), 0);
-  EXPECT_EQ(completeFilesOf(Picture::jpeg(bytes(95))), 0U);
-  EXPECT_EQ(files(), (std::vector<std::string>{"Capture0002.dat"}));
-  EXPECT_EQ(recorder.logged("Writing " + folder + "/Capture0001.jpg failed: "), 1U);
 }
 
 TEST_F(PictureTest, AnItemWithoutImageDataIsLetGoOfAndADataObjectIsOpenedASecondTime) {

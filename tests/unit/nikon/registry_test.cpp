@@ -6,6 +6,13 @@
 #include "DeferredCalls.h"
 #include "ServiceTest.h"
 
+// What the forwarding module calls.
+extern "C" __attribute__((visibility("default"))) std::int32_t testEntryPoint(
+    tagNkMAIDObject* object, std::uint32_t command, std::uint32_t parameter, std::uint32_t dataType, std::uint64_t data,
+    NkMAIDCompletionProc* completion, void* reference) {
+  return virtualcamera::entryPoint(object, command, parameter, dataType, data, completion, reference);
+}
+
 namespace {
 
 using virtualcamera::Capability;
