@@ -86,8 +86,8 @@ Message Recorder::await(const std::string& name, std::size_t n) {
 
 std::size_t Recorder::count(const std::string& name) {
   const std::lock_guard guard(_lock);
-  return static_cast<std::size_t>(std::count_if(_messages.begin(), _messages.end(),
-                                                [&](const Message& message) { return message.name == name; }));
+  return static_cast<std::size_t>(
+      std::count_if(_messages.begin(), _messages.end(), [&](const Message& message) { return message.name == name; }));
 }
 
 void Recorder::forgetMessages() {

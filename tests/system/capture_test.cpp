@@ -70,16 +70,5 @@ TEST_F(Capture, WorksWithoutAFolderOfCameras) {
   EXPECT_EQ(jpeg.substr(0, 3), "\xff\xd8\xff");
 }
 
-TEST_F(Capture, ALimitOnFileSizesCostsThePicturesAboveItOnly) {
-  helper.limit("-f 1000");
-  startWithCamera();
-  // What is known to be too large before it begins is not announced.
-  drop(studio() / "0.jpg", pattern(2'000'000, 3));
-  drop(studio() / "1.jpg", pattern(1'000'000, 1));
-  EXPECT_EQ(helper.await("objectWasAdded").number("file_size"), 1'000'000);
-  drop(studio() / "2.jpg", pattern(1000, 2));
-  EXPECT_TRUE(readFile(helper.await("fileDownloadComplete").text("file_path")) == pattern(1000, 2));
-}
-
 }  // namespace
 }  // namespace tether

@@ -1,4 +1,4 @@
-// Elements: tables and their keys, and their bytes. What any bytes do to the decoder, the fuzz target `element` tells.
+// Elements: tables and their keys, and their bytes. What any bytes do to the decoder, the fuzz target `wire` tells.
 #include <gtest/gtest.h>
 
 #include <limits>
@@ -70,17 +70,6 @@ TEST(Elements, KeysStandInOrderOfTheirKindsThenOfValueUnsignedBytesOrIdentity) {
   EXPECT_NE(table.elementForKey(2), nullptr);
   EXPECT_EQ(table.elementForKey(3), nullptr);
   EXPECT_EQ(static_cast<std::string>(*table.elementForKey(&nil)), "") << "a number is no text";
-}
-
-TEST(Elements, ADictionaryOfNumbersTruthValuesAndTextsIsImportedAndNothingElse) {
-  KtLuaTETable table;
-  table.addDictionary({{"text"s, "value"s}, {"cut\0off"s, true}, {5LL, 2.5}, {false, 9LL}});
-  EXPECT_EQ(static_cast<std::string>(*table.elementForKey("text")), "value");
-  EXPECT_EQ(static_cast<double>(*table.elementForKey("cut")), 1.0);
-  EXPECT_EQ(static_cast<double>(*table.elementForKey(5)), 2.5);
-  EXPECT_EQ(static_cast<double>(*table.elementForKey(0)), 9.0);
-  EXPECT_DEATH(table.addDictionary({{"none"s, platform::Value()}}),
-               "Could not convert either key or value to an KtLuaTE element - key: none, value: <null>");
 }
 
 TEST(Encoding, TheWorkedExampleReadsAndWritesTheSame63Bytes) {

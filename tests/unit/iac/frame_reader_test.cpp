@@ -1,4 +1,4 @@
-// What no chunking of any bytes may change, the fuzz target `frame_reader` tells.
+// What no chunking of any bytes may change, the fuzz target `wire` tells.
 #include <gtest/gtest.h>
 #include <unistd.h>
 

@@ -121,38 +121,6 @@ TEST_F(DownloadThreadTest, AnItemIsDeletedWithItsWrapperAndAWrapperEmptiedWithIt
   loop->perform([&] { downloads.addToDownloadQueue(wrapper); });  // skipped
 }
 
-TEST_F(ServiceTest, ACameraThatGoesWithItemsQueuedAndOneThatNeverCompletesLeavesNothingBehind) {
-  auto& camera = model.addCamera(1, "One");
-  model.addCamera(2, "Two");
-  camera.setTransfer({.deliveryBytes = 10, .bytesPerSecond = 1000});
-  model.faults().add(
-      {.level = Level::Data, .camera = 2, .command = kNkMAIDCommand_CapStart, .times = 1, .noCompletion = true});
-  model.faults().add(
-      {.level = Level::Data, .camera = 2, .command = kNkMAIDCommand_Async, .answer = 0, .doAnyway = true});
-  start();
-  for (int shot = 0; shot < 10; ++shot) camera.shoot(Picture::jpeg(bytes(100000)));
-  idleUntil("objectWasAdded");
-  model.removeCamera(1);
-  idleUntil("deviceRemoved");
-  idleUntil([&] { return model.openObjects() == 2U; });  // the module and camera 2
-  model.camera(2)->shoot(Picture::jpeg(bytes(7)));
-  idleUntil("objectWasAdded", 2);
-  // Of another one, whose data object opens late, nothing ever comes.
-  model.camera(2)->setTransfer({.pollsPerDelivery = 1U << 30});
-  model.faults().add({.level = Level::Data, .item = 2, .command = kNkMAIDCommand_Open, .times = 1, .answer = 152});
-  model.camera(2)->shoot(Picture::jpeg(bytes(7)));
-  idleUntil([&] { return recorder.traced("could not open data type") == 1; });
-  model.camera(2)->setAlive(false);
-  service->doCameraScanOnIdle();
-  idleUntil("deviceRemoved", 2);
-  idleUntil([&] { return model.openObjects() == 1U; });
-  model.removeCamera(2);
-  // Its picture was whole, although nothing ever said so.
-  EXPECT_EQ(idleUntil("fileDownloadComplete").numbers.at("capture_id"), 2);
-  model.addCamera(1, "One").shoot(Picture::jpeg(bytes(7)));
-  EXPECT_EQ(idleUntil("fileDownloadComplete", 2).numbers.at("capture_id"), 3);
-}
-
 TEST_F(ServiceTest, ACameraThatIsJudgedGoneFinishesItsTransfersFirstAndHoldsNobodyUp) {
   auto& camera = model.addCamera(1, "One");
   camera.setTransfer({.deliveryBytes = 10, .bytesPerSecond = 1});
@@ -166,19 +134,6 @@ TEST_F(ServiceTest, ACameraThatIsJudgedGoneFinishesItsTransfersFirstAndHoldsNobo
   camera.setTransfer({});
   idleUntil([&] { return model.openObjects() == 1U; });
   EXPECT_EQ(read(recorder.await("fileDownloadComplete", 2).strings.at("file_path")), bytes(300, 1));
-}
-
-TEST_F(ServiceTest, AnItemsEventDuringATransferHoldsNobodyUp) {
-  auto& camera = model.addCamera(1, "One");
-  camera.setTransfer({.deliveryBytes = 10, .bytesPerSecond = 1});
-  start();
-  for (int shot = 0; shot < 2; ++shot) camera.shoot(Picture::jpeg(bytes(1000)));
-  idleUntil("objectWasAdded");
-  camera.raise(2, Level::Item, kNkMAIDEvent_CapChange, 0);
-  idle();
-  EXPECT_EQ(recorder.names(), "deviceAdded objectWasAdded");
-  camera.setTransfer({});
-  idleUntil("fileDownloadComplete", 2);
 }
 
 // In polls of the main thread, and from a thread of the module.

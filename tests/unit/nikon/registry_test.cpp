@@ -1,8 +1,5 @@
 // Cameras that come and go, and requests that name them.
 
-#include <cmath>
-#include <future>
-
 #include "DeferredCalls.h"
 #include "ServiceTest.h"
 
@@ -132,45 +129,6 @@ TEST_F(ServiceTest, SettingsFollowEachOtherHalfASecondApartAndAtMostOneWaitsAndN
   recorder.forgetMessages();
   turn();
   EXPECT_EQ(recorder.names(), "");
-}
-
-TEST_F(ServiceTest, ASettingsRequestIsDroppedWhileTheSdkIsBusy) {
-  model.addCamera(1, "One");
-  start();
-  connect(1, 1);
-  recorder.forgetMessages();
-  std::promise<void> held;
-  std::promise<void> release;
-  auto holder = std::async(std::launch::async, [&] {
-    const std::lock_guard guard(getAsyncLock());
-    held.set_value();
-    release.get_future().wait();
-  });
-  held.get_future().wait();
-  askSettings(2, 0x301);
-  EXPECT_EQ(recorder.names(), "");
-  release.set_value();
-  holder.get();
-  askSettings(3, 0x301);
-  EXPECT_EQ(recorder.names(), "ok#3");
-}
-
-TEST_F(ServiceTest, APayloadWithoutAUsableDeviceIdNamesNoModule) {
-  model.addCamera(1, "One");
-  start();
-  KtLuaTETable text;
-  text.Set("device_id", new KtLuaTEString("769"));
-  KtLuaTETable nothing;
-  KtLuaTENumber number(769);
-  for (KtLuaTE* payload : std::initializer_list<KtLuaTE*>{&text, &nothing, &number, nullptr}) {
-    service->connectDevice(1, payload);
-  }
-  for (const double wild : {std::nan(""), 1e300, -1e300, 4294967296.0 + 769}) {
-    service->connectDevice(2, device(wild).get());
-  }
-  EXPECT_EQ(recorder.traced("could not find module id 0"), 8U);
-  service->connectDevice(3, device(769.9).get());
-  EXPECT_EQ(recorder.names(), "deviceAdded ok#3 cameraSettingsChanged");
 }
 
 }  // namespace

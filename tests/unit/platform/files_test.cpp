@@ -2,7 +2,6 @@
 #include <gtest/gtest.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <array>
 #include <csignal>
 #include <cstdlib>
@@ -13,7 +12,6 @@
 #include "FileHandle.h"
 #include "FileManager.h"
 #include "Log.h"
-#include "MemoryBlock.h"
 #include "NotificationCenter.h"
 
 namespace {
@@ -22,7 +20,6 @@ using namespace std::chrono_literals;
 using platform::Clock;
 using platform::FileHandle;
 using platform::FileManager;
-using platform::MemoryBlock;
 using platform::RunLoop;
 
 struct Pipe {
@@ -35,23 +32,6 @@ struct Pipe {
   std::unique_ptr<FileHandle> reading;
   std::unique_ptr<FileHandle> writing;
 };
-
-TEST(FileHandle, ABackgroundReadReportsWhatThereIsAndThenTheEnd) {
-  Pipe pipe;
-  std::vector<std::string> chunks;
-  auto observer = platform::NotificationCenter::defaultCenter().addObserver(
-      std::string(platform::kFileHandleReadCompletionNotification), pipe.reading.get(), [&](const auto& notification) {
-        chunks.emplace_back(notification.data->bytes(), notification.data->length());
-        if (!chunks.back().empty()) pipe.reading->readInBackgroundAndNotify();
-      });
-  pipe.reading->readInBackgroundAndNotify();
-  EXPECT_EQ(pipe.writing->write("one", 3), 0);
-  while (chunks.empty()) RunLoop::current()->runOnce(Clock::now() + 1s);
-  EXPECT_EQ(pipe.writing->write("two", 3), 0);
-  pipe.writing.reset();
-  while (chunks.size() < 3) RunLoop::current()->runOnce(Clock::now() + 1s);
-  EXPECT_EQ(chunks, (std::vector<std::string>{"one", "two", ""}));
-}
 
 TEST(FileHandle, WritesFromTwoThreadsStayWholeThroughAFullNonBlockingPipeAndFailWhenItIsClosed) {
   Pipe pipe;
@@ -100,26 +80,6 @@ TEST_F(InFolder, ADanglingLinkIsSomethingAndATemporaryDirectoryThatIsNotThereIsN
   EXPECT_TRUE(FileManager::isDirectory(platform::temporaryDirectory()));
   platform::setLogSink(nullptr);
   EXPECT_NE(logged.find(folder + "/missing cannot be used: No such file or directory; using "), std::string::npos);
-}
-
-TEST_F(InFolder, RoomIsKeptWithoutChangingTheSizeAndItsLackIsTold) {
-  const std::string path = folder + "/file";
-  const int file = open(path.c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0600);
-  EXPECT_EQ(FileManager::reserve(file, 1U << 20), 0);
-  EXPECT_NE(FileManager::reserve(file, std::uint64_t{1} << 60), 0);
-  EXPECT_EQ(std::filesystem::file_size(path), 0U);
-  close(file);
-}
-
-TEST(MemoryBlock, IsZeroAndMoves) {
-  for (const std::size_t size : {std::size_t{100}, std::size_t{5} << 20}) {
-    MemoryBlock block(size);
-    EXPECT_TRUE(std::all_of(block.data(), block.data() + size, [](char byte) { return byte == 0; }));
-    block.data()[size - 1] = 'x';
-    const MemoryBlock moved = std::move(block);
-    EXPECT_EQ(moved.data()[moved.size() - 1], 'x');
-  }
-  EXPECT_EQ(MemoryBlock(SIZE_MAX / 2).data(), nullptr);
 }
 
 TEST_F(InFolder, ABundleNeedsAFolderWithAnExecutableThatLoads) {

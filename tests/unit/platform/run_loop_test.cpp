@@ -170,14 +170,6 @@ class OtherThread : public ::testing::Test {
   std::shared_ptr<RunLoop> loop;
 };
 
-TEST_F(OtherThread, CallsFromOneThreadRunThereInOrderAndOnce) {
-  std::vector<int> seen;
-  for (int index = 0; index < 1000; ++index) loop->post([&, index] { seen.push_back(index); });
-  EXPECT_TRUE(loop->perform([&] { EXPECT_TRUE(loop->isCurrent()); }));
-  ASSERT_EQ(seen.size(), 1000U);
-  for (int index = 0; index < 1000; ++index) EXPECT_EQ(seen[static_cast<std::size_t>(index)], index);
-}
-
 TEST_F(OtherThread, WaitingFromTheOwnThreadRunsTheCallAtOnceAndAWaiterGetsTheExceptionOfItsCall) {
   std::string order;
   loop->perform([&] {

@@ -19,15 +19,6 @@ using namespace std::chrono_literals;
 using platform::NotificationCenter;
 using platform::Thread;
 
-TEST(Thread, DescriptionsTellThreadsApartAndCarryTheWholeName) {
-  const auto thread = Thread::make([] { Thread::setCurrentName("Nikon Download Thread"); });
-  thread->start();
-  thread->join();
-  EXPECT_NE(thread->description().find("Nikon Download Thread"), std::string::npos);
-  EXPECT_NE(thread->description(), Thread::current()->description());
-  EXPECT_EQ(Thread::current(), Thread::current());
-}
-
 TEST(Locks, AreHadWithinTheWaitOrNotAtAll) {
   platform::TimedLock lock;
   platform::RecursiveTimedLock recursive;
@@ -108,15 +99,6 @@ TEST(Notifications, RemovingOnAnotherThreadWaitsForTheDeliveryInProgress) {
   EXPECT_TRUE(left);
   poster.join();
   releaser.join();
-}
-
-TEST(Log, ASinkGetsTheTextCutToTheLongestLine) {
-  std::string line;
-  platform::setLogSink([&](const std::string& text) { line = text; });
-  platform::log("%s %s", "text", std::string(10000, 'x').c_str());
-  platform::setLogSink(nullptr);
-  EXPECT_EQ(line.substr(0, 6), "text x");
-  EXPECT_TRUE(line.size() > 3000 && line.size() < 4096) << line.size();
 }
 
 TEST(Log, LinesThatNobodyReadsAreDroppedAndTheNextOneSaysHowMany) {

@@ -4,7 +4,6 @@
 #include <filesystem>
 #include <fstream>
 
-#include "DebugTrace.h"
 #include "DeferredCalls.h"
 #include "RunLoop.h"
 #include "UniqueFilePath.h"
@@ -37,11 +36,6 @@ TEST(DeferredCalls, ANewerRequestForTheSamePairCancelsTheOlderAndRestartsTheWait
   EXPECT_EQ(others, 1);
 }
 
-TEST(DeferredCalls, TheClockCountsSecondsFromTheYear2001) {
-  EXPECT_GT(currentTime(), 24 * 365 * 86400.0);
-  EXPECT_LT(currentTime(), 200 * 365 * 86400.0);
-}
-
 TEST(UniqueFilePath, NumbersFromTwoBeforeTheExtensionWhateverHasTheName) {
   std::string pattern = ::testing::TempDir() + "tether-unique-XXXXXX";
   std::string folder = mkdtemp(pattern.data());
@@ -58,20 +52,6 @@ TEST(UniqueFilePath, NumbersFromTwoBeforeTheExtensionWhateverHasTheName) {
   expect("folder.nef", "folder-2.nef");
   expect("link.nef", "link-2.nef");
   std::filesystem::remove_all(folder);
-}
-
-TEST(DebugTrace, LinesAreFormattedCutAndDroppedWithoutASink) {
-  std::vector<std::string> lines;
-  setDebugSink([&](const char* text) { lines.emplace_back(text); });
-  debugmsgint("SendErrorMessage - error code: %xd", -1);
-  debugmsgint("could not find module id %ld", 256);
-  debugmsgstr("%s", std::string(5000, 'x').c_str());
-  setDebugSink(nullptr);
-  debugmsg("dropped");
-  ASSERT_EQ(lines.size(), 3U);
-  EXPECT_EQ(lines[0], "SendErrorMessage - error code: ffffffffd");
-  EXPECT_EQ(lines[1], "could not find module id 256");
-  EXPECT_EQ(lines[2].size(), 2047U);
 }
 
 }  // namespace

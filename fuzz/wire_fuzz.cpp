@@ -1,6 +1,7 @@
-// Any bytes through the frame reader, in one piece and in several chunkings: the messages are the same, no reader waits
-// long before it looks at what it has, and where the stream is in step a good frame is read. The first byte of the
-// input chooses the chunks.
+// Any bytes as an element: what decodes can be written and read again, and what does not says how much is missing at
+// the least. Then through the frame reader, in one piece and in several chunkings: the messages are the same, no reader
+// waits long before it looks at what it has, and where the stream is in step a good frame is read. The first byte of
+// the input chooses the chunks.
 #include <unistd.h>
 
 #include <algorithm>
@@ -15,6 +16,7 @@
 #include "Log.h"
 
 using testkit::check;
+using Element = std::unique_ptr<KtLuaTE>;
 
 // A friend of the reader.
 struct KtRCMessageAccumulatorTest {
@@ -31,6 +33,76 @@ namespace {
 
 constexpr std::int64_t kMostFiller = 4096;
 constexpr std::size_t kMostSingleBytes = 128;
+
+struct Decoded {
+  enum { element, unknownTag, incomplete, malformed } kind;
+  Element value;
+  std::int64_t consumed = 0;
+  std::int64_t missing = 0;
+};
+
+Decoded decode(const char* bytes, std::size_t count) {
+  KtNSDataReadStreamBuf buffer(std::make_shared<platform::Data>(std::vector<char>(bytes, bytes + count)));
+  std::istream in(&buffer);
+  try {
+    Element value(KtLuaTE::createFromStream(in));
+    const std::int64_t consumed = in.tellg();
+    const auto kind = value ? Decoded::element : Decoded::unknownTag;
+    return {kind, std::move(value), consumed, 0};
+  } catch (const KtStreamError& error) {
+    return {Decoded::incomplete, nullptr, 0, error.missing()};
+  } catch (const platform::Exception&) {
+    return {Decoded::malformed, nullptr, 0, 0};
+  }
+}
+
+std::string encode(const KtLuaTE& element) {
+  KtNSDataWriteStreamBuf buffer;
+  std::ostream out(&buffer);
+  element.writeToStream(out);
+  check(out.good(), "writing never fails");
+  return {buffer.getNSData()->bytes(), buffer.getNSData()->length()};
+}
+
+// Data and tables as keys stand in order of their addresses, which differ between two objects of one content.
+bool hasAddressKeys(const KtLuaTE& element) {
+  const auto* const table = dynamic_cast<const KtLuaTETable*>(&element);
+  if (table == nullptr) return false;
+  for (const auto& [key, value] : table->getEntries()) {
+    check(key != nullptr && value != nullptr, "a table holds no null");
+    const bool byAddress = key->getType() == kKtLuaTypeData || key->getType() == kKtLuaTypeTable;
+    if (byAddress || hasAddressKeys(*value)) return true;
+  }
+  return false;
+}
+
+void checkSame(const std::string& one, const std::string& other, bool byAddress) {
+  check(one.size() == other.size(), "the same element has the same size");
+  check(byAddress || one == other, "the same element has the same bytes");
+}
+
+void checkElement(const std::uint8_t* bytes, std::size_t count) {
+  const auto* const text = reinterpret_cast<const char*>(bytes);
+  const Decoded first = decode(text, count);
+  if (first.kind == Decoded::incomplete) check(first.missing > 0, "what is incomplete misses something");
+  if (first.kind == Decoded::unknownTag) check(first.consumed == 4, "an unknown tag is all that is read");
+  if (first.kind != Decoded::element) return;
+
+  const bool byAddress = hasAddressKeys(*first.value);
+  const std::string written = encode(*first.value);
+  const Decoded second = decode(written.data(), written.size());
+  check(second.kind == Decoded::element, "what was written can be read");
+  check(second.consumed == static_cast<std::int64_t>(written.size()), "what was written is read to its end");
+  checkSame(written, encode(*second.value), byAddress);
+  const Element copy(first.value->copy());
+  checkSame(written, encode(*copy), byAddress);
+
+  // Every beginning is incomplete, and says no more than the truth of what is missing.
+  const std::int64_t part = bytes[count - 1] * first.consumed / 256;
+  const Decoded beginning = decode(text, static_cast<std::size_t>(part));
+  check(beginning.kind == Decoded::incomplete, "the beginning of an element is incomplete");
+  check(beginning.missing > 0 && beginning.missing <= first.consumed - part, "no more is missing than there is");
+}
 
 std::string goodFrame() {
   const std::array<char, 30> bytes = {26, 0,   0,   0,   7,   0,   0,   0,   3,   0,   0, 0, 10, 0, 0,
@@ -60,10 +132,7 @@ void feed(const KtRCMessageAccumulator& reader, const char* bytes, std::size_t c
 
 std::string describe(const KtLuaTE* element) {
   if (element == nullptr) return "none";
-  KtNSDataWriteStreamBuf buffer;
-  std::ostream out(&buffer);
-  element->writeToStream(out);
-  std::string bytes(buffer.getNSData()->bytes(), buffer.getNSData()->length());
+  std::string bytes = encode(*element);
   // Keys may stand in another order, but their bytes are the same.
   std::sort(bytes.begin(), bytes.end());
   return bytes;
@@ -123,6 +192,7 @@ Outcome read(const char* bytes, std::size_t count, std::size_t largest, std::uin
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* input, size_t size) {
   if (size < 2) return 0;
+  checkElement(input, size);
   const auto* const bytes = reinterpret_cast<const char*>(input + 1);
   const std::size_t count = size - 1;
   const Outcome whole = read(bytes, count, SIZE_MAX, UINT32_MAX);
