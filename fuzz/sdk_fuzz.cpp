@@ -14,6 +14,7 @@
 #include "ContentContainer.h"
 #include "ContentData.h"
 #include "FaultyModule.h"
+#include "FrameWriter.h"
 #include "HostMessages.h"
 #include "KtNSDataStreamBuf.h"
 #include "Log.h"
@@ -223,10 +224,8 @@ void useModule() {
 
 void SendMessageToClient(long /*id*/, const char* name, KtLuaTETable* data) {
   if (data == nullptr) return;
-  KtNSDataWriteStreamBuf written;
-  std::ostream out(&written);
-  data->writeToStream(out);
-  KtNSDataReadStreamBuf buffer(written.getNSData());
+  const std::string written = encodeElement(*data);
+  KtNSDataReadStreamBuf buffer(std::make_shared<platform::Data>(std::vector<char>(written.begin(), written.end())));
   std::istream in(&buffer);
   const std::unique_ptr<KtLuaTE> read(KtLuaTE::createFromStream(in));
   check(read != nullptr && buffer.available() == 0, "the host can read every message");

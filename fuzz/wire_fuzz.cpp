@@ -10,8 +10,8 @@
 #include <string>
 #include <vector>
 
+#include "FrameWriter.h"
 #include "Input.h"
-#include "KtNSDataStreamBuf.h"
 #include "KtRCMessageAccumulator.h"
 #include "Log.h"
 
@@ -56,14 +56,6 @@ Decoded decode(const char* bytes, std::size_t count) {
   }
 }
 
-std::string encode(const KtLuaTE& element) {
-  KtNSDataWriteStreamBuf buffer;
-  std::ostream out(&buffer);
-  element.writeToStream(out);
-  check(out.good(), "writing never fails");
-  return {buffer.getNSData()->bytes(), buffer.getNSData()->length()};
-}
-
 // Data and tables as keys stand in order of their addresses, which differ between two objects of one content.
 bool hasAddressKeys(const KtLuaTE& element) {
   const auto* const table = dynamic_cast<const KtLuaTETable*>(&element);
@@ -89,13 +81,13 @@ void checkElement(const std::uint8_t* bytes, std::size_t count) {
   if (first.kind != Decoded::element) return;
 
   const bool byAddress = hasAddressKeys(*first.value);
-  const std::string written = encode(*first.value);
+  const std::string written = encodeElement(*first.value);
   const Decoded second = decode(written.data(), written.size());
   check(second.kind == Decoded::element, "what was written can be read");
   check(second.consumed == static_cast<std::int64_t>(written.size()), "what was written is read to its end");
-  checkSame(written, encode(*second.value), byAddress);
+  checkSame(written, encodeElement(*second.value), byAddress);
   const Element copy(first.value->copy());
-  checkSame(written, encode(*copy), byAddress);
+  checkSame(written, encodeElement(*copy), byAddress);
 
   // Every beginning is incomplete, and says no more than the truth of what is missing.
   const std::int64_t part = bytes[count - 1] * first.consumed / 256;
@@ -132,7 +124,7 @@ void feed(const KtRCMessageAccumulator& reader, const char* bytes, std::size_t c
 
 std::string describe(const KtLuaTE* element) {
   if (element == nullptr) return "none";
-  std::string bytes = encode(*element);
+  std::string bytes = encodeElement(*element);
   // Keys may stand in another order, but their bytes are the same.
   std::sort(bytes.begin(), bytes.end());
   return bytes;

@@ -92,6 +92,7 @@ struct Group {
   const char* name;
   int first, last;  // of the ways
 };
+void PrintTo(const Group& group, std::ostream* out) { *out << group.name; }
 constexpr Group kGroups[] = {{"Refused", kRefused, kNothingDone},
                              {"Nonsense", kNonsense, kStormBefore - 1},
                              {"Storms", kStormBefore, kStormElsewhere}};

@@ -76,13 +76,6 @@ std::string littleEndian(std::uint32_t number) {
   return bytes;
 }
 
-std::string encoded(const KtLuaTE& element) {
-  KtNSDataWriteStreamBuf buffer;
-  std::ostream out(&buffer);
-  element.writeToStream(out);
-  return {buffer.getNSData()->bytes(), buffer.getNSData()->length()};
-}
-
 std::string frame(std::int32_t id, const std::string& nameElement, const std::string& dataElement) {
   const auto length = static_cast<std::uint32_t>(sizeof id + nameElement.size() + dataElement.size());
   return littleEndian(length) + littleEndian(static_cast<std::uint32_t>(id)) + nameElement + dataElement;
@@ -91,7 +84,7 @@ std::string frame(std::int32_t id, const std::string& nameElement, const std::st
 std::string request(const char* name, std::int32_t id, std::optional<double> deviceId) {
   KtLuaTETable table;
   if (deviceId) table.Set("device_id", new KtLuaTENumber(*deviceId));
-  return frame(id, encoded(KtLuaTEString(name)), deviceId ? encoded(table) : encoded(KtLuaTENil()));
+  return encodeFrame(id, name, deviceId ? &table : nullptr);
 }
 
 // The process.

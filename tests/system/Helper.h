@@ -11,8 +11,8 @@
 
 #include "Descriptors.h"
 #include "Files.h"
+#include "FrameWriter.h"
 #include "HelperProcess.h"
-#include "KtLuaTableMarshalling.h"
 
 namespace tether {
 
@@ -37,7 +37,6 @@ struct Received {
 };
 
 std::string littleEndian(std::uint32_t number);
-std::string encoded(const KtLuaTE& element);
 std::string frame(std::int32_t id, const std::string& nameElement, const std::string& dataElement);
 std::string request(const char* name, std::int32_t id, std::optional<double> deviceId = std::nullopt);
 

@@ -66,15 +66,15 @@ TEST_F(Requests, WhatIsNoRequestOrDoesNothingHasNoAnswerAndCostsNothingBehindIt)
                            "connectdevice", "Connectdevice", "connectDevice ", "heartbeat", "", "doCapture"}) {
     helper.send(request(name, 5, kStudio));
   }
-  const std::string connecting = encoded(KtLuaTEString("connectDevice"));
-  const std::string payload = encoded(KtLuaTENil());
-  helper.send(frame(5, encoded(KtLuaTENumber(5)), payload));
+  const std::string connecting = encodeElement(KtLuaTEString("connectDevice"));
+  const std::string payload = encodeElement(KtLuaTENil());
+  helper.send(frame(5, encodeElement(KtLuaTENumber(5)), payload));
   helper.send(frame(5, littleEndian(9), payload));  // no kind of element
   helper.send(frame(5, connecting, littleEndian(9)));
   helper.send(frame(5, connecting, littleEndian(kKtLuaTypeData) + littleEndian(0xFFFFFFFF)));  // can never be a message
   KtLuaTETable text;
   text.Set("device_id", new KtLuaTEString("257"));
-  helper.send(frame(5, connecting, encoded(text)));
+  helper.send(frame(5, connecting, encodeElement(text)));
   for (const double device : {0.0, 1.0, 0x0201 + 0.0, 1e300, -1e300, std::numeric_limits<double>::quiet_NaN()}) {
     helper.send(request("connectDevice", 5, device) + request("getCameraSettings", 5, device) +
                 request("disconnectDevice", 5, device));

@@ -5,6 +5,7 @@
 #include <unistd.h>
 
 #include "Files.h"
+#include "FrameWriter.h"
 #include "VirtualCamera.h"
 
 using platform::RunLoop;
@@ -68,16 +69,9 @@ class Task : public testing::Test {
   // A request on its way; answers what the helper has written until it was carried out.
   std::string request(const std::string& name) {
     after = {};
-    KtNSDataWriteStreamBuf buffer;
-    std::ostream out(&buffer);
     KtLuaTETable device;
     device.Set("device_id", new KtLuaTENumber(0x301));
-    KtLuaTEString(name).writeToStream(out);
-    device.writeToStream(out);
-    const auto elements = buffer.getNSData();
-    const std::int32_t head[] = {static_cast<std::int32_t>(elements->length() + 4), 7};
-    const std::string bytes = std::string(reinterpret_cast<const char*>(head), sizeof head) +
-                              std::string(elements->bytes(), elements->length());
+    const std::string bytes = encodeFrame(7, name, &device);
     EXPECT_EQ(write(input, bytes.data(), bytes.size()), static_cast<ssize_t>(bytes.size()));
     while (!after.call) RunLoop::current()->runOnce(platform::Clock::now() + std::chrono::seconds(5));
     EXPECT_EQ(after.seconds, 0.1) << "a request is carried out so much later";

@@ -4,20 +4,11 @@
 #include <limits>
 #include <memory>
 
-#include "KtLuaTableMarshalling.h"
-#include "KtNSDataStreamBuf.h"
+#include "FrameWriter.h"
 
 namespace {
 
 using namespace std::string_literals;
-
-std::string encode(const KtLuaTE& element) {
-  KtNSDataWriteStreamBuf buffer;
-  std::ostream out(&buffer);
-  element.writeToStream(out);
-  const auto data = buffer.getNSData();
-  return {data->bytes(), data->length()};
-}
 
 struct Decoded {
   std::unique_ptr<KtLuaTE> element;
@@ -80,15 +71,15 @@ TEST(Encoding, TheWorkedExampleReadsAndWritesTheSame63Bytes) {
   KtLuaTETable table;
   table.Set("name", new KtLuaTEString("cam"));
   table.Set("device_id", new KtLuaTENumber(3));
-  EXPECT_EQ(encode(table), example);
+  EXPECT_EQ(encodeElement(table), example);
   const auto decoded = decode(example);
   EXPECT_EQ(decoded.consumed, 63);
-  EXPECT_EQ(encode(*decoded.element), example);
+  EXPECT_EQ(encodeElement(*decoded.element), example);
 }
 
 TEST(Encoding, StringsEndAtTheirFirstNulAndDataDoesNot) {
-  EXPECT_EQ(encode(KtLuaTEString("")), "\3\0\0\0\1\0\0\0\0"s);
-  EXPECT_EQ(encode(KtLuaTEString("a\0b"s)), "\3\0\0\0\2\0\0\0a\0"s);
+  EXPECT_EQ(encodeElement(KtLuaTEString("")), "\3\0\0\0\1\0\0\0\0"s);
+  EXPECT_EQ(encodeElement(KtLuaTEString("a\0b"s)), "\3\0\0\0\2\0\0\0a\0"s);
   const struct {
     std::string bytes;
     std::int64_t consumed;
@@ -103,9 +94,9 @@ TEST(Encoding, StringsEndAtTheirFirstNulAndDataDoesNot) {
     EXPECT_EQ(static_cast<std::string>(*decoded.element), row.text);
   }
   const std::string data = "\4\0\0\0\3\0\0\0\0\xff\0"s;
-  EXPECT_EQ(encode(KtLuaTEData(data.data() + 8, 3)), data);
+  EXPECT_EQ(encodeElement(KtLuaTEData(data.data() + 8, 3)), data);
   EXPECT_THROW(KtLuaTEData(data.data(), -1), int);
-  EXPECT_EQ(encode(*decode(data).element), data);
+  EXPECT_EQ(encodeElement(*decode(data).element), data);
 }
 
 TEST(Encoding, ARepeatedKeyTakesTheLaterValue) {
@@ -143,9 +134,9 @@ TEST(Encoding, TablesNestTwoHundredDeepAndNoDeeper) {
     for (int level = 1; level < depth; ++level) bytes += "\5\0\0\0\1\0\0\0\1\0\0\0"s;
     return bytes + "\5\0\0\0\0\0\0\0"s;
   };
-  EXPECT_EQ(encode(*decode(nested(200)).element), nested(200));
+  EXPECT_EQ(encodeElement(*decode(nested(200)).element), nested(200));
   EXPECT_THROW(decode(nested(201)), KtMalformedElement);
-  EXPECT_EQ(encode(*decode(nested(200)).element), nested(200)) << "the refusal left its mark";
+  EXPECT_EQ(encodeElement(*decode(nested(200)).element), nested(200)) << "the refusal left its mark";
 }
 
 TEST(StreamBuffers, SeekingClampsCountsBackwardsFromTheEndAndAShortReadEndsTheStream) {
