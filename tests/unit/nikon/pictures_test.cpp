@@ -124,7 +124,7 @@ TEST_F(PictureTest, AnItemWithoutImageDataIsLetGoOfAndADataObjectIsOpenedASecond
   EXPECT_EQ(completeFilesOf(other), 0U);
   EXPECT_EQ(recorder.traced("could not open data type: 1"), 1U);
   EXPECT_EQ(recorder.names(), "deviceAdded objectWasAdded fileDownloadComplete");
-  EXPECT_EQ(model.openObjects(), 2U) << "the module and the camera";
+  idleUntil([&] { return model.openObjects() == 2; });  // the module and the camera
 }
 
 }  // namespace
