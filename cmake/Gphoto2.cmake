@@ -1,0 +1,22 @@
+# Whether real cameras are built in: GPHOTO2_FOUND, and PkgConfig::GPHOTO2 where it is so.
+if(NOT TETHER_GPHOTO2 MATCHES "^(AUTO|ON|OFF)$")
+  message(FATAL_ERROR "TETHER_GPHOTO2 is AUTO, ON or OFF")
+endif()
+
+set(GPHOTO2_FOUND FALSE)
+if(APPLE OR TETHER_GPHOTO2 STREQUAL "OFF")
+  message(STATUS "Real cameras are left out")
+  return()
+endif()
+
+find_package(PkgConfig QUIET)
+if(PKG_CONFIG_FOUND)
+  pkg_check_modules(GPHOTO2 QUIET IMPORTED_TARGET libgphoto2>=2.5.20)
+endif()
+if(GPHOTO2_FOUND)
+  message(STATUS "Real cameras through libgphoto2 ${GPHOTO2_VERSION}")
+elseif(TETHER_GPHOTO2 STREQUAL "ON")
+  message(FATAL_ERROR "Real cameras need libgphoto2 (Debian: libgphoto2-dev) and pkg-config")
+else()
+  message(STATUS "Real cameras are left out: no libgphoto2 (Debian: libgphoto2-dev) and pkg-config")
+endif()

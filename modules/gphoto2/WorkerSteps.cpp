@@ -1,0 +1,153 @@
+// What a camera's thread does while the camera is there.
+#include "Log.h"
+#include "Worker.h"
+
+namespace gphoto2camera {
+namespace {
+
+using std::chrono::milliseconds;
+using std::chrono::seconds;
+
+constexpr int kWait = 50;                // for events, where nothing else is to be done
+constexpr milliseconds kRest{10};        // between two such waits
+constexpr milliseconds kLookEvery{100};  // for events, while pictures are read
+constexpr int kMostEvents = 64;          // in one look
+constexpr seconds kAskEvery{10};         // whether an idle camera on a network is still there
+constexpr seconds kBusyFor{1};
+
+int32_t resultOf(int result, const std::string& words) {
+  if (result == GP_ERROR_CAMERA_BUSY) return kNkMAIDResult_DeviceBusy;
+  if (words.find("Full") != std::string::npos) return kNkMAIDResult_MediaFull;
+  if (words.find("ocus") != std::string::npos) return kNkMAIDResult_OutOfFocus;
+  return kNkMAIDResult_CaptureFailure;
+}
+
+}  // namespace
+
+void Worker::step() {
+  if (_shutter->take()) shoot();
+  if (!_device.isOpen()) return;
+  const Reader::Outcome outcome = _reader.step(_device);
+  if (outcome == Reader::Outcome::Lost) return lost("a picture could not be read on");
+  const bool reads = outcome == Reader::Outcome::Read;
+  const Time now = Clock::now();
+  if (reads) _lastHeard = now;
+  if (reads && now - _lastLook < kLookEvery) return;
+  if (!lookForEvents(reads ? 0 : kWait)) return;
+  for (std::vector<File> shot = _pairing.next(now); !shot.empty(); shot = _pairing.next(now)) announce(shot);
+  if (_settings.isDue(now)) readSettings();
+  if (address().isNetwork() && now - _lastHeard >= kAskEvery && !isThere()) return lost("the camera does not answer");
+  if (!reads) _bell->rest(kRest);
+}
+
+// False: the camera is lost. An error here need not mean that: the object of an event may have gone.
+bool Worker::lookForEvents(int milliseconds) {
+  _lastLook = Clock::now();
+  for (int i = 0; i < kMostEvents; ++i) {
+    Event event;
+    const int result = _device.wait(i == 0 ? milliseconds : 0, event);
+    if (result != GP_OK) {
+      const std::string words = _device.words(result);
+      if (!isThere()) return lost(words), false;
+      _bell->rest(kLookEvery);
+      return true;
+    }
+    if (event.kind == Event::Kind::None) return true;
+    if (event.kind == Event::Kind::Added) arrive(std::move(event.file));
+    if (event.kind == Event::Kind::Changed) _settings.mark(Clock::now());
+  }
+  return true;
+}
+
+bool Worker::isThere() {
+  const int result = _device.ask();
+  _lastHeard = Clock::now();
+  return result == GP_OK || Device::isAnswer(result);
+}
+
+void Worker::shoot() {
+  const Time until = Clock::now() + kBusyFor;
+  std::optional<File> taken;
+  int result = _device.trigger(taken);
+  while (result == GP_ERROR_CAMERA_BUSY && Clock::now() < until && !_stopping) {
+    _bell->rest(kLookEvery);
+    result = _device.trigger(taken);
+  }
+  const std::string words = _device.words(result);
+  _shutter->end(result == GP_OK ? int32_t{kNkMAIDResult_NoError} : resultOf(result, words));
+  if (taken) arrive(std::move(*taken));
+  if (result == GP_OK) return;
+  log(_name, "did not take a picture: " + words);
+  if (!isThere()) lost(words);
+}
+
+// A file that was just shot.
+void Worker::arrive(File file) {
+  if (file.kind() == File::Kind::Other) {
+    log(_name, file.path() + " is no picture and stays on the card");
+    return;
+  }
+  if (const int result = _device.describe(file); result != GP_OK) {
+    log(_name, "says nothing about " + file.path() + ": " + _device.words(result));
+    return;
+  }
+  if (file.size == 0 || file.size > UINT32_MAX) {
+    log(_name, file.path() + " stays on the card: it has " + std::to_string(file.size) + " bytes");
+    return;
+  }
+  if (!_place->memory->isNew(file)) return;
+  _place->memory->announce(file);
+  _settings.noteSize(file.size);
+  _settings.mark(Clock::now());
+  _pairing.add(std::move(file), Clock::now());
+}
+
+void Worker::announce(const std::vector<File>& files) {
+  camerakit::Shot shot;
+  std::vector<std::shared_ptr<Transfer>> transfers;
+  for (const File& file : files) {
+    transfers.push_back(std::make_shared<Transfer>(_name, file, _bell));
+    shot.push_back({.fileDataType = file.dataType(),
+                    .name = file.name,
+                    .source = std::make_shared<RemotePicture>(transfers.back())});
+  }
+  const std::vector<uint32_t> ids = _camera->add(std::move(shot));
+  for (size_t i = 0; i < ids.size(); ++i) {
+    _items[files[i].path()] = ids[i];
+    _reader.add(std::move(transfers[i]));
+  }
+}
+
+// What nobody took to its end, and what was shot meanwhile.
+void Worker::catchUp(const std::vector<File>& added) {
+  Pairing shots;
+  const Time now = Clock::now();
+  Memory& memory = *_place->memory;
+  for (const File& file : memory.owed()) {
+    File there = file;
+    if (_reader.holds(file) || _pairing.holds(file)) continue;
+    if (const auto item = _items.find(file.path()); item != _items.end()) _camera->removeItem(item->second);
+    const bool gone = _device.describe(there) != GP_OK || there.size != file.size;
+    if (gone) log(_name, file.path() + " was announced and is not on the camera any more");
+    const bool again = !gone && memory.announce(file);
+    if (!gone && !again) log(_name, file.path() + " stays on the card: its transfer has failed too often");
+    if (again)
+      shots.add(file, now);
+    else
+      memory.finish(file);
+  }
+  for (const File& file : added) {
+    if (file.kind() == File::Kind::Other || file.size == 0 || file.size > UINT32_MAX) continue;
+    memory.announce(file);
+    shots.add(file, now);
+  }
+  for (std::vector<File> shot = shots.next(Time::max()); !shot.empty(); shot = shots.next(Time::max())) announce(shot);
+}
+
+void Worker::readSettings() {
+  _settings.read(_device, *_camera);
+  _pairing.setQuality(_settings.quality(_device));
+  _lastHeard = Clock::now();
+}
+
+}  // namespace gphoto2camera
