@@ -20,6 +20,7 @@ namespace {
 using camerakit::Guard;
 
 constexpr int kMostAnnouncements = 3;
+constexpr int64_t kRoughly = 60;  // seconds
 const char* const kMarks[] = {"seen", "new", "done"};
 
 // <folder>/<model>-<serial>.txt, of letters and figures.
@@ -77,12 +78,14 @@ bool Memory::knows(const File& file) const {
   return found != _entries.end() && found->second.file.size == file.size;
 }
 
-// Cameras may tell of a file twice. One of the same name and size, but of another time, is another one.
+// Cameras may tell of a file twice, and the library may know its time only roughly. One of the same name and size, but
+// of quite another time, is another one: the card was formatted, and its numbers begin anew.
 bool Memory::isNew(const File& file) const {
   const Guard guard(_mutex);
   const auto found = _entries.find(file.path());
   if (found == _entries.end() || found->second.mark == Mark::Seen) return true;
-  return found->second.file.size != file.size || found->second.file.time != file.time;
+  const File& known = found->second.file;
+  return known.size != file.size || std::abs(known.time - file.time) > kRoughly;
 }
 
 bool Memory::announce(const File& file) {
@@ -117,7 +120,7 @@ std::string Memory::lineOf(Mark mark, const File& file) {
 
 void Memory::put(Mark mark, const File& file) {
   Entry& entry = _entries[file.path()];
-  const bool another = entry.file.size != file.size || entry.file.time != file.time;
+  const bool another = entry.file.size != file.size || std::abs(entry.file.time - file.time) > kRoughly;
   if (another) entry.announced = 0;
   if (mark == Mark::Announced && (another || entry.mark != mark)) entry.order = ++_lastOrder;
   entry.file = file;

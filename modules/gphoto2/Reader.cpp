@@ -110,6 +110,7 @@ Reader::Outcome Reader::failed(Job& job, const std::string& why) {
   const uint64_t offset = job.transfer->state().missing;
   if (offset != job.stuckAt) job.failures = 0;
   job.stuckAt = offset;
+  _why = "reading " + job.transfer->file().path() + ": " + why;
   if (++job.failures >= kMostFailures) giveUp(job, kNkMAIDResult_DataTransFailure, why);
   return Outcome::Lost;
 }

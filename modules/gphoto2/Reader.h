@@ -27,6 +27,7 @@ class Reader {
   // Reads one piece, or a whole file where there are no pieces. Lost: the connection must not be used again, for what
   // it brings next may be the late answer to this.
   Outcome step(Device& device);
+  const std::string& why() const { return _why; }  // it was lost
 
  private:
   struct Job {
@@ -47,6 +48,7 @@ class Reader {
   std::vector<Job> _jobs{};
   std::vector<uint8_t> _buffer{};
   bool _inPieces = true;
+  std::string _why{};
 };
 
 }  // namespace gphoto2camera

@@ -28,7 +28,7 @@ void Worker::step() {
   if (_shutter->take()) shoot();
   if (!_device.isOpen()) return;
   const Reader::Outcome outcome = _reader.step(_device);
-  if (outcome == Reader::Outcome::Lost) return lost("a picture could not be read on");
+  if (outcome == Reader::Outcome::Lost) return lost(_reader.why());
   const bool reads = outcome == Reader::Outcome::Read;
   const Time now = Clock::now();
   if (reads) _lastHeard = now;
