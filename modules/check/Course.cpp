@@ -16,6 +16,7 @@ using namespace std::chrono_literals;
 
 constexpr auto kIdlePause = 5ms;
 constexpr auto kSettling = 100ms;  // for what comes by itself: pictures that are there, late callbacks
+constexpr auto kFirstCamera = 3s;  // one on a network has to be asked first
 constexpr auto kAsLongAsItTakes = 24h;
 
 // Loaded as the helper loads it: all symbols resolved, none given to others.
@@ -118,6 +119,7 @@ void Course::check() {
   if (!_module->open()) return;
   _module->examine();
   scan();
+  idleUntil([this] { return !_present.empty(); }, kFirstCamera);
   idle(kSettling);
   if (_present.empty()) _module->note("there is no camera: only the module itself was checked");
   const auto present = _present;

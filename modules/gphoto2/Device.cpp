@@ -77,8 +77,25 @@ class Progress {
 
 bool Device::isAnswer(int result) { return result == GP_ERROR_CAMERA_BUSY || result == GP_ERROR_NOT_SUPPORTED; }
 
+int Device::note(int result) {
+  switch (result) {
+    case GP_ERROR_IO:
+    case GP_ERROR_TIMEOUT:
+    case GP_ERROR_IO_READ:
+    case GP_ERROR_IO_WRITE:
+    case GP_ERROR_IO_USB_FIND:
+    case GP_ERROR_IO_USB_CLEAR_HALT:
+      _isBroken = true;
+      break;
+    default:
+      break;
+  }
+  return result;
+}
+
 int Device::open() {
   close();
+  _isBroken = false;
   return Library::get().open(_address, _context, _camera);
 }
 
@@ -90,7 +107,7 @@ int Device::wait(int milliseconds, Event& event) {
   event = {};
   CameraEventType type = GP_EVENT_TIMEOUT;
   void* raw = nullptr;
-  const int result = gp_camera_wait_for_event(_camera, milliseconds, &type, &raw, _context.fresh());
+  const int result = note(gp_camera_wait_for_event(_camera, milliseconds, &type, &raw, _context.fresh()));
   const std::unique_ptr<void, FreeWith<std::free>> data(raw);
   if (result != GP_OK || type == GP_EVENT_TIMEOUT) return result;
   event.kind = Event::Kind::Other;
@@ -106,7 +123,8 @@ int Device::wait(int milliseconds, Event& event) {
 
 int Device::describe(File& file) {
   CameraFileInfo info{};
-  const int result = gp_camera_file_get_info(_camera, file.folder.c_str(), file.name.c_str(), &info, _context.fresh());
+  const int result =
+      note(gp_camera_file_get_info(_camera, file.folder.c_str(), file.name.c_str(), &info, _context.fresh()));
   if (result != GP_OK) return result;
   file.size = (info.file.fields & GP_FILE_INFO_SIZE) != 0 ? info.file.size : 0;
   file.time = (info.file.fields & GP_FILE_INFO_MTIME) != 0 ? info.file.mtime : 0;
@@ -139,10 +157,10 @@ bool Device::canCapture() const {
 }
 
 int Device::trigger(std::optional<File>& taken) {
-  const int result = gp_camera_trigger_capture(_camera, _context.fresh());
+  const int result = note(gp_camera_trigger_capture(_camera, _context.fresh()));
   if (result != GP_ERROR_NOT_SUPPORTED) return result;
   CameraFilePath path{};
-  const int captured = gp_camera_capture(_camera, GP_CAPTURE_IMAGE, &path, _context.fresh());
+  const int captured = note(gp_camera_capture(_camera, GP_CAPTURE_IMAGE, &path, _context.fresh()));
   if (captured == GP_OK) taken = File{.folder = path.folder, .name = path.name};
   return captured;
 }
@@ -151,7 +169,7 @@ int Device::list(const std::string& folder, bool folders, std::vector<std::strin
   const List list = makeList();
   if (!list) return GP_ERROR_NO_MEMORY;
   const auto call = folders ? gp_camera_folder_list_folders : gp_camera_folder_list_files;
-  const int result = call(_camera, folder.c_str(), list.get(), _context.fresh());
+  const int result = note(call(_camera, folder.c_str(), list.get(), _context.fresh()));
   if (result == GP_OK) names = namesOf(list.get());
   return result;
 }
@@ -159,7 +177,7 @@ int Device::list(const std::string& folder, bool folders, std::vector<std::strin
 int Device::ask() {
   CameraStorageInformation* storages = nullptr;
   int count = 0;
-  const int result = gp_camera_get_storageinfo(_camera, &storages, &count, _context.fresh());
+  const int result = note(gp_camera_get_storageinfo(_camera, &storages, &count, _context.fresh()));
   std::free(storages);
   return result;
 }
@@ -167,7 +185,7 @@ int Device::ask() {
 void Device::space(std::optional<uint64_t>& pictures, std::optional<uint64_t>& bytes) {
   CameraStorageInformation* raw = nullptr;
   int count = 0;
-  if (gp_camera_get_storageinfo(_camera, &raw, &count, _context.fresh()) != GP_OK) return;
+  if (note(gp_camera_get_storageinfo(_camera, &raw, &count, _context.fresh())) != GP_OK) return;
   const std::unique_ptr<CameraStorageInformation, FreeWith<std::free>> storages(raw);
   for (int i = 0; i < count; ++i) {
     // Cameras that do not know say all ones.
@@ -179,20 +197,20 @@ void Device::space(std::optional<uint64_t>& pictures, std::optional<uint64_t>& b
 
 std::vector<std::string> Device::names() {
   const List list = makeList();
-  if (!list || gp_camera_list_config(_camera, list.get(), _context.fresh()) != GP_OK) return {};
+  if (!list || note(gp_camera_list_config(_camera, list.get(), _context.fresh())) != GP_OK) return {};
   return namesOf(list.get());
 }
 
 std::optional<std::string> Device::value(const std::string& name) {
   CameraWidget* raw = nullptr;
-  if (gp_camera_get_single_config(_camera, name.c_str(), &raw, _context.fresh()) != GP_OK) return std::nullopt;
+  if (note(gp_camera_get_single_config(_camera, name.c_str(), &raw, _context.fresh())) != GP_OK) return std::nullopt;
   const Widget widget(raw);
   return textOf(raw);
 }
 
 std::vector<std::string> Device::choices(const std::string& name) {
   CameraWidget* raw = nullptr;
-  if (gp_camera_get_single_config(_camera, name.c_str(), &raw, _context.fresh()) != GP_OK) return {};
+  if (note(gp_camera_get_single_config(_camera, name.c_str(), &raw, _context.fresh())) != GP_OK) return {};
   const Widget widget(raw);
   std::vector<std::string> found;
   for (int i = 0; i < gp_widget_count_choices(raw); ++i)
@@ -206,7 +224,7 @@ int Device::set(const std::string& name, const std::string& value) {
     return result;
   const Widget widget(raw);
   if (const int result = gp_widget_set_value(raw, value.c_str()); result != GP_OK) return result;
-  return gp_camera_set_single_config(_camera, name.c_str(), raw, _context.fresh());
+  return note(gp_camera_set_single_config(_camera, name.c_str(), raw, _context.fresh()));
 }
 
 std::string Device::summary(const std::string& key) {

@@ -34,6 +34,9 @@ class Device {
   int open();
   void close();  // what is closed may be opened again
   bool isOpen() const { return _camera != nullptr; }
+  // A call timed out, or the connection failed within it. It must not be used again: the next call might be given the
+  // late answer to that one, and take it for its own.
+  bool isBroken() const { return _isBroken; }
   std::string words(int result) const { return _context.words(result); }
 
   // One event, or none after that time.
@@ -65,9 +68,12 @@ class Device {
   std::string summary(const std::string& key);
 
  private:
+  int note(int result);
+
   const Address _address;
   Context _context;
   ::Camera* _camera = nullptr;
+  bool _isBroken = false;
 };
 
 }  // namespace gphoto2camera

@@ -21,15 +21,25 @@ struct FreeWith {
 using PortList = std::unique_ptr<GPPortInfoList, FreeWith<gp_port_info_list_free>>;
 using List = std::unique_ptr<CameraList, FreeWith<gp_list_free>>;
 
-// Letting a network camera go closes descriptor 0, which it never opened. The next file of anyone would get that
-// number, and be closed with the next camera.
-void keepPlaceOfInput() {
-  if (fcntl(STDIN_FILENO, F_GETFD) >= 0) return;
-  const int placeholder = ::open("/dev/null", O_RDWR | O_CLOEXEC);
-  if (placeholder <= STDIN_FILENO) return;  // it has taken the place, or there is none
-  dup2(placeholder, STDIN_FILENO);
-  ::close(placeholder);
-}
+// Letting a network camera go closes descriptor 0, which the library never opened. The next file of anyone would get
+// that number, and be closed with the next camera. So what stood there is put back.
+class InputKept {
+ public:
+  InputKept() : _copy(fcntl(STDIN_FILENO, F_DUPFD_CLOEXEC, STDERR_FILENO + 1)) {}
+  ~InputKept() {
+    restore();
+    if (_copy >= 0) ::close(_copy);
+  }
+  InputKept(const InputKept&) = delete;
+  InputKept& operator=(const InputKept&) = delete;
+
+  void restore() const {
+    if (_copy >= 0 && fcntl(STDIN_FILENO, F_GETFD) < 0) dup2(_copy, STDIN_FILENO);
+  }
+
+ private:
+  const int _copy;  // -1 where nothing stood there
+};
 
 std::string pathOf(GPPortInfoList* ports, int at) {
   GPPortInfo info{};
@@ -126,6 +136,7 @@ int Library::prepare(const Address& address, ::Camera* camera) {
 
 int Library::open(const Address& address, Context& context, ::Camera*& camera) {
   const Guard guard(_mutex);
+  const InputKept kept;
   ::Camera* made = nullptr;
   if (const int result = gp_camera_new(&made); result != GP_OK) return result;
   int result = prepare(address, made);
@@ -134,16 +145,15 @@ int Library::open(const Address& address, Context& context, ::Camera*& camera) {
     camera = made;
   else
     gp_camera_unref(made);
-  keepPlaceOfInput();
   return result;
 }
 
 void Library::close(::Camera* camera, Context& context) {
   const Guard guard(_mutex);
+  const InputKept kept;
   gp_camera_exit(camera, context.fresh());
-  keepPlaceOfInput();
+  kept.restore();  // or the next line closes what took the place
   gp_camera_unref(camera);
-  keepPlaceOfInput();
 }
 
 }  // namespace gphoto2camera

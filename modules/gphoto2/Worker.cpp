@@ -80,6 +80,7 @@ int Worker::open(std::vector<File>& added) {
   if (const int result = _device.open(); result != GP_OK) return result;
   _settings.connect(_device);
   if (!identify()) return GP_OK;
+  if (_device.isBroken()) return GP_ERROR_TIMEOUT;
   _settings.keepOnCard(_device, _name);
   _pairing.setQuality(_settings.quality(_device));
   return look(_device, *_place->memory, added);
@@ -112,7 +113,6 @@ void Worker::failed(int result) {
   _lastFailure = _camera ? 0 : result;
   _attempts = std::min<int>(_attempts + 1, kPauses.size() - 1);
   _nextAttempt = Clock::now() + kPauses[static_cast<size_t>(_attempts)];
-  if (!_lostAt || Clock::now() - *_lostAt > kLookedFor) unplug();
 }
 
 void Worker::lost(const std::string& why) {
@@ -124,6 +124,7 @@ void Worker::lost(const std::string& why) {
 
 void Worker::waitForNextAttempt() {
   if (_shutter->take()) _shutter->end(kNkMAIDResult_SessionFailure);
+  if (_camera && (!_lostAt || Clock::now() - *_lostAt > kLookedFor)) unplug();
   const auto left = std::chrono::ceil<milliseconds>(_nextAttempt - Clock::now());
   _bell->rest(std::clamp(left, milliseconds{1}, milliseconds{1000}));
 }

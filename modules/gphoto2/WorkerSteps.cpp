@@ -25,6 +25,7 @@ int32_t resultOf(int result, const std::string& words) {
 }  // namespace
 
 void Worker::step() {
+  if (_device.isBroken()) return lost("the camera did not answer in time");
   if (_shutter->take()) shoot();
   if (!_device.isOpen()) return;
   const Reader::Outcome outcome = _reader.step(_device);
@@ -35,7 +36,7 @@ void Worker::step() {
   if (reads && now - _lastLook < kLookEvery) return;
   if (!lookForEvents(reads ? 0 : kWait)) return;
   for (std::vector<File> shot = _pairing.next(now); !shot.empty(); shot = _pairing.next(now)) announce(shot);
-  if (_settings.isDue(now)) readSettings();
+  if (!_device.isBroken() && _settings.isDue(now)) readSettings();
   if (address().isNetwork() && now - _lastHeard >= kAskEvery && !isThere()) return lost("the camera does not answer");
   if (!reads) _bell->rest(kRest);
 }
@@ -62,7 +63,7 @@ bool Worker::lookForEvents(int milliseconds) {
 bool Worker::isThere() {
   const int result = _device.ask();
   _lastHeard = Clock::now();
-  return result == GP_OK || Device::isAnswer(result);
+  return !_device.isBroken() && (result == GP_OK || Device::isAnswer(result));
 }
 
 void Worker::shoot() {
