@@ -156,13 +156,12 @@ bool Device::canCapture() const {
   return (abilities.operations & (GP_OPERATION_CAPTURE_IMAGE | GP_OPERATION_TRIGGER_CAPTURE)) != 0;
 }
 
-int Device::trigger(std::optional<File>& taken) {
+int Device::trigger(bool& waited) {
   const int result = note(gp_camera_trigger_capture(_camera, _context.fresh()));
   if (result != GP_ERROR_NOT_SUPPORTED) return result;
   CameraFilePath path{};
-  const int captured = note(gp_camera_capture(_camera, GP_CAPTURE_IMAGE, &path, _context.fresh()));
-  if (captured == GP_OK) taken = File{.folder = path.folder, .name = path.name};
-  return captured;
+  waited = true;
+  return note(gp_camera_capture(_camera, GP_CAPTURE_IMAGE, &path, _context.fresh()));
 }
 
 int Device::list(const std::string& folder, bool folders, std::vector<std::string>& names) {

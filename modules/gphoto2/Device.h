@@ -39,7 +39,8 @@ class Device {
   bool isBroken() const { return _isBroken; }
   std::string words(int result) const { return _context.words(result); }
 
-  // One event, or none after that time.
+  // One event, or none after that time. With an error an event may be lost, and is not found by listing either: the
+  // camera has to be opened anew.
   int wait(int milliseconds, Event& event);
   // Size and time. Costs nothing of a file that an event named or that was listed.
   int describe(File& file);
@@ -47,8 +48,9 @@ class Device {
   int read(const File& file, uint64_t offset, uint8_t* bytes, uint64_t& size);
   // The whole of it, into a descriptor, which stays the caller's; onBytes is called whenever some came.
   int fetch(const File& file, int descriptor, const std::function<void()>& onBytes);
-  // Fires the shutter. Without that, where the camera can only take a picture and wait for it: the file, too.
-  int trigger(std::optional<File>& taken);
+  // Fires the shutter. Where the camera can only take a picture and wait for it, that is done, and `waited` says so:
+  // events were lost meanwhile.
+  int trigger(bool& waited);
   bool canCapture() const;
 
   // Names in a folder. Listing a folder for the first time is what costs.

@@ -7,6 +7,7 @@
 
 #include "Library.h"
 #include "Log.h"
+#include "Signals.h"
 
 namespace gphoto2camera {
 namespace {
@@ -69,6 +70,7 @@ void Finder::stop() {
 }
 
 void Finder::run(int round) {
+  blockSignals();
   std::vector<std::string> ports;
   while (!isOver(round)) {
     look(ports, round);

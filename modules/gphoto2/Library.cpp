@@ -1,10 +1,15 @@
 #include "Library.h"
 
 #include <fcntl.h>
+#include <sys/socket.h>
 #include <unistd.h>
 
 #include <algorithm>
+#include <cstdlib>
+#include <filesystem>
 #include <memory>
+#include <set>
+#include <system_error>
 
 namespace gphoto2camera {
 namespace {
@@ -39,6 +44,34 @@ class InputKept {
 
  private:
   const int _copy;  // -1 where nothing stood there
+};
+
+// A network camera that could not be opened all the way leaves its sockets behind. Nothing else in the process makes
+// any while the library's lock is held.
+class LeftSockets {
+ public:
+  LeftSockets() : _before(sockets()) {}
+  void close() const {
+    for (const int socket : sockets())
+      if (!_before.contains(socket)) ::close(socket);
+  }
+
+ private:
+  static std::set<int> sockets() {
+    std::set<int> found;
+    std::error_code error;
+    for (std::filesystem::directory_iterator it("/proc/self/fd", error), end; !error && it != end;
+         it.increment(error)) {
+      const int descriptor = std::atoi(it->path().filename().c_str());
+      int domain = 0;
+      socklen_t size = sizeof domain;
+      if (getsockopt(descriptor, SOL_SOCKET, SO_DOMAIN, &domain, &size) == 0 && domain == AF_INET)
+        found.insert(descriptor);
+    }
+    return found;
+  }
+
+  const std::set<int> _before;
 };
 
 std::string pathOf(GPPortInfoList* ports, int at) {
@@ -137,14 +170,17 @@ int Library::prepare(const Address& address, ::Camera* camera) {
 int Library::open(const Address& address, Context& context, ::Camera*& camera) {
   const Guard guard(_mutex);
   const InputKept kept;
+  const LeftSockets left;
   ::Camera* made = nullptr;
   if (const int result = gp_camera_new(&made); result != GP_OK) return result;
   int result = prepare(address, made);
   if (result == GP_OK) result = gp_camera_init(made, context.fresh());
-  if (result == GP_OK)
+  if (result == GP_OK) {
     camera = made;
-  else
+  } else {
     gp_camera_unref(made);
+    left.close();
+  }
   return result;
 }
 

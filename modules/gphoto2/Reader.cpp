@@ -13,7 +13,7 @@ namespace {
 
 constexpr int kMostFailures = 3;  // at one place of a file
 // The library copies what a camera sends, which may be more than it was asked for.
-constexpr uint64_t kSlack = 1u << 16;
+constexpr uint64_t kSlack = 1u << 20;
 
 // An unlinked file; -1 where there is no room for one.
 int temporaryFile() {

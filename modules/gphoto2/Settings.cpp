@@ -2,6 +2,8 @@
 
 #include <algorithm>
 #include <cctype>
+#include <utility>
+#include <vector>
 
 #include "Log.h"
 
@@ -55,11 +57,16 @@ bool Settings::isDue(Time now) const {
   return _marked && now - *_marked >= kQuiet && now - _lastRead >= kBetweenReadings;
 }
 
-void Settings::read(Device& device, camerakit::Camera& camera) {
-  for (const Setting& setting : kSettings) show(camera, setting.capability, first(device, setting.names));
-  show(camera, kNkMAIDCapability_FreeBytes, shotsLeft(device));
+bool Settings::read(Device& device, camerakit::Camera& camera) {
+  std::vector<std::pair<uint32_t, std::optional<std::string>>> values;
+  for (const Setting& setting : kSettings) values.emplace_back(setting.capability, first(device, setting.names));
+  values.emplace_back(kNkMAIDCapability_FreeBytes, shotsLeft(device));
   _marked.reset();
   _lastRead = std::chrono::steady_clock::now();
+  if (std::none_of(values.begin(), values.end(), [](const auto& value) { return value.second.has_value(); }))
+    return false;
+  for (const auto& [capability, text] : values) show(camera, capability, text);
+  return true;
 }
 
 std::optional<std::string> Settings::quality(Device& device) const {

@@ -22,7 +22,8 @@ class Settings {
   // One may have changed; or the room on the card has.
   void mark(Time now);
   bool isDue(Time now) const;
-  void read(Device& device, camerakit::Camera& camera);
+  // False, and nothing has changed for the host: there was none to be read, as on a connection that is dead.
+  bool read(Device& device, camerakit::Camera& camera);
 
   // What the camera says of the files that it stores.
   std::optional<std::string> quality(Device& device) const;

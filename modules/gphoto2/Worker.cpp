@@ -6,6 +6,7 @@
 
 #include "Card.h"
 #include "Log.h"
+#include "Signals.h"
 #include "Trouble.h"
 
 namespace gphoto2camera {
@@ -18,6 +19,7 @@ using std::chrono::seconds;
 constexpr std::array<milliseconds, 8> kPauses{seconds{0}, milliseconds{250}, milliseconds{500}, seconds{1},
                                               seconds{2}, seconds{5},        seconds{10},       seconds{30}};
 constexpr seconds kLookedFor{5};
+constexpr milliseconds kBetweenOpenings{500};  // where a camera is lost again at once
 
 }  // namespace
 
@@ -26,6 +28,7 @@ Worker::Worker(camerakit::Model& model, Roster& roster, Address address)
 
 void Worker::start() {
   std::thread([self = shared_from_this()] {
+    blockSignals();
     self->run();
     self->_hasEnded = true;
   }).detach();
@@ -61,7 +64,7 @@ bool Worker::connect() {
   }
   _attempts = _lastFailure = 0;
   _lostAt.reset();
-  _lastHeard = Clock::now();
+  _openedAt = _lastHeard = Clock::now();
   if (_camera) {
     _reader.reconnected();
     _settings.mark(_lastHeard);
@@ -119,7 +122,7 @@ void Worker::lost(const std::string& why) {
   log(_name, "lost the connection: " + why);
   _device.close();
   _lostAt = Clock::now();
-  _nextAttempt = *_lostAt + kPauses[static_cast<size_t>(_attempts)];
+  _nextAttempt = std::max(*_lostAt, _openedAt + kBetweenOpenings);
 }
 
 void Worker::waitForNextAttempt() {

@@ -52,10 +52,10 @@ class Worker : public std::enable_shared_from_this<Worker> {
   bool lookForEvents(int milliseconds);
   bool isThere();
   void shoot();
-  void arrive(File file);
+  bool arrive(File file);
   void announce(const std::vector<File>& shot);
   void catchUp(const std::vector<File>& added);
-  void readSettings();
+  bool readSettings();
 
   camerakit::Model& _model;
   Roster& _roster;
@@ -77,7 +77,7 @@ class Worker : public std::enable_shared_from_this<Worker> {
   int _attempts = 0;                         // since it was open
   int _lastFailure = 0;
   std::optional<Time> _lostAt{};
-  Time _nextAttempt{};
+  Time _nextAttempt{}, _openedAt{};
   Time _lastLook{}, _lastHeard{};
 };
 

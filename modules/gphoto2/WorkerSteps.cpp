@@ -36,25 +36,20 @@ void Worker::step() {
   if (reads && now - _lastLook < kLookEvery) return;
   if (!lookForEvents(reads ? 0 : kWait)) return;
   for (std::vector<File> shot = _pairing.next(now); !shot.empty(); shot = _pairing.next(now)) announce(shot);
-  if (!_device.isBroken() && _settings.isDue(now)) readSettings();
+  if (!_device.isBroken() && _settings.isDue(now) && !readSettings()) return lost("settings cannot be read");
   if (address().isNetwork() && now - _lastHeard >= kAskEvery && !isThere()) return lost("the camera does not answer");
   if (!reads) _bell->rest(kRest);
 }
 
-// False: the camera is lost. An error here need not mean that: the object of an event may have gone.
+// False: the connection is given up. An error may be all that is heard of a picture.
 bool Worker::lookForEvents(int milliseconds) {
   _lastLook = Clock::now();
   for (int i = 0; i < kMostEvents; ++i) {
     Event event;
     const int result = _device.wait(i == 0 ? milliseconds : 0, event);
-    if (result != GP_OK) {
-      const std::string words = _device.words(result);
-      if (!isThere()) return lost(words), false;
-      _bell->rest(kLookEvery);
-      return true;
-    }
+    if (result != GP_OK) return lost("waiting for events: " + _device.words(result)), false;
     if (event.kind == Event::Kind::None) return true;
-    if (event.kind == Event::Kind::Added) arrive(std::move(event.file));
+    if (event.kind == Event::Kind::Added && !arrive(std::move(event.file))) return false;
     if (event.kind == Event::Kind::Changed) _settings.mark(Clock::now());
   }
   return true;
@@ -68,39 +63,38 @@ bool Worker::isThere() {
 
 void Worker::shoot() {
   const Time until = Clock::now() + kBusyFor;
-  std::optional<File> taken;
-  int result = _device.trigger(taken);
+  bool waited = false;
+  int result = _device.trigger(waited);
   while (result == GP_ERROR_CAMERA_BUSY && Clock::now() < until && !_stopping) {
     _bell->rest(kLookEvery);
-    result = _device.trigger(taken);
+    result = _device.trigger(waited);
   }
   const std::string words = _device.words(result);
+  if (result != GP_OK) log(_name, "did not take a picture: " + words);
   _shutter->end(result == GP_OK ? int32_t{kNkMAIDResult_NoError} : resultOf(result, words));
-  if (taken) arrive(std::move(*taken));
-  if (result == GP_OK) return;
-  log(_name, "did not take a picture: " + words);
-  if (!isThere()) lost(words);
+  if (waited || (result != GP_OK && !isThere())) lost(waited ? "it is opened anew to see what it took" : words);
 }
 
-// A file that was just shot.
-void Worker::arrive(File file) {
+// A file that was just shot. False: what the camera said of it makes no sense, and the connection is given up.
+bool Worker::arrive(File file) {
+  if (const int result = _device.describe(file); result != GP_OK || file.name.starts_with('<')) {
+    lost("asking for " + file.path() + ": " + _device.words(result));
+    return false;
+  }
   if (file.kind() == File::Kind::Other) {
     log(_name, file.path() + " is no picture and stays on the card");
-    return;
-  }
-  if (const int result = _device.describe(file); result != GP_OK) {
-    log(_name, "says nothing about " + file.path() + ": " + _device.words(result));
-    return;
+    return true;
   }
   if (file.size == 0 || file.size > UINT32_MAX) {
     log(_name, file.path() + " stays on the card: it has " + std::to_string(file.size) + " bytes");
-    return;
+    return true;
   }
-  if (!_place->memory->isNew(file)) return;
+  if (!_place->memory->isNew(file)) return true;
   _place->memory->announce(file);
   _settings.noteSize(file.size);
   _settings.mark(Clock::now());
   _pairing.add(std::move(file), Clock::now());
+  return true;
 }
 
 void Worker::announce(const std::vector<File>& files) {
@@ -145,10 +139,11 @@ void Worker::catchUp(const std::vector<File>& added) {
   for (std::vector<File> shot = shots.next(Time::max()); !shot.empty(); shot = shots.next(Time::max())) announce(shot);
 }
 
-void Worker::readSettings() {
-  _settings.read(_device, *_camera);
+bool Worker::readSettings() {
+  if (!_settings.read(_device, *_camera) && !isThere()) return false;
   _pairing.setQuality(_settings.quality(_device));
   _lastHeard = Clock::now();
+  return true;
 }
 
 }  // namespace gphoto2camera
