@@ -7,6 +7,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <csignal>
+#include <cstdlib>
 #include <filesystem>
 
 namespace tether {
@@ -14,6 +15,7 @@ namespace {
 
 using namespace std::chrono_literals;
 
+constexpr const char* kState = "TETHER_STATE";
 // How long each step of an end may take that the helper did not make by itself.
 constexpr auto kEndStep = 1s;
 constexpr auto kDestructionGrace = 2s;
@@ -56,6 +58,22 @@ std::string absolute(const std::string& path) {
   return path.empty() ? path : std::filesystem::absolute(path, ignored).string();
 }
 
+// Where camera modules remember which pictures they have delivered. Nothing where there is no place for it.
+std::string stateFolder() {
+  const char* const states = std::getenv("XDG_STATE_HOME");
+  const char* const home = std::getenv("HOME");
+  std::string folder;
+  if (states != nullptr && *states == '/') {
+    folder = states;
+  } else if (home != nullptr && *home == '/') {
+    folder = std::string(home) + "/.local/state";
+  }
+  if (folder.empty()) return folder;
+  std::error_code error;
+  std::filesystem::create_directories(folder += "/tether", error);
+  return error ? std::string() : folder;
+}
+
 }  // namespace
 
 Session::Session(const Options& options)
@@ -85,6 +103,12 @@ void Session::start(const Options& options) {
   HelperProcess::Start child;
   child.executable = options.helper.empty() ? helperBesideExecutable() : options.helper;
   child.environment = options.environment;
+  if (std::getenv(kState) == nullptr) {
+    // Of two of a name the first counts.
+    if (const std::string folder = stateFolder(); !folder.empty()) {
+      child.environment.push_back(std::string(kState) + "=" + folder);
+    }
+  }
   child.environment.push_back("TMPDIR=" + _directory->path());
   child.input = toHelper.read.get();
   child.output = fromHelper.write.get();

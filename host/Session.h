@@ -30,8 +30,9 @@
 namespace tether {
 
 struct SessionOptions {
-  std::string helper;                    // path of its executable; "" for the one beside this executable
-  std::vector<std::string> environment;  // NAME=value, for the helper alone
+  std::string helper;  // path of its executable; "" for the one beside this executable
+  // NAME=value, for the helper alone. TETHER_STATE, a folder that outlives it, is this user's where nobody names one.
+  std::vector<std::string> environment;
   // What the helper logs is passed on to this one; -1: this process's standard error. The session neither waits for it
   // nor closes it.
   int errorDescriptor = -1;

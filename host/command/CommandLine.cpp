@@ -27,12 +27,15 @@ const char* const kStatuses =
 const char* const kEnvironment =
     "Environment:\n"
     "  TMPDIR                  where pictures lie until they are saved, in a private folder (default: /tmp)\n"
+    "  TETHER_CAMERAS          cameras on the network, separated by spaces, like ptpip:192.168.1.7\n"
+    "  TETHER_STATE            where is kept which pictures were received (default: ~/.local/state/tether)\n"
     "  TETHER_VIRTUAL_CAMERAS  the folder from which virtual cameras take their pictures\n"
     "  TERM                    with dumb there is no live line\n\n";
 
 const char* const kExamples =
     "Examples:\n"
     "  tether list\n"
+    "  tether capture --virtual\n"
     "  tether capture --count 3 --every 10 --output shoot/\n"
     "  tether watch --output shoot/ --json\n"
     "\n";
@@ -86,6 +89,8 @@ void addCommon(CLI::App& command, Values& values, const char* timeoutText) {
   command.add_option("--timeout", values.timeout.value, timeoutText)
       ->type_name("SECONDS")
       ->check([](const std::string& text) { return secondsAbove(0.001, text); });
+  command.add_flag("--virtual", values.options.virtualCamera,
+                   "Show a virtual camera, which makes its own pictures, to try things out");
   command.add_option("--helper", values.options.helper, "The helper's executable (default: the one beside tether)")
       ->type_name("PATH");
   command

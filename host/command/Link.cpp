@@ -1,6 +1,7 @@
 #include "Link.h"
 
 #include <algorithm>
+#include <cstdlib>
 #include <system_error>
 
 #include "Report.h"
@@ -10,6 +11,7 @@ namespace {
 
 using namespace std::chrono_literals;
 
+constexpr const char* kVirtualCameras = "TETHER_VIRTUAL_CAMERAS";
 constexpr auto kDefaultTimeout = 30s;
 constexpr auto kSilenceBeyondTimeout = std::chrono::milliseconds(10s);
 // A module may find its cameras only when it is first polled, a second after the start.
@@ -54,6 +56,9 @@ void Link::start() {
   options.errorDescriptor = _log.get();
   options.wakeup = _wakeup;
   options.folder = _options.output;
+  if (_options.virtualCamera && std::getenv(kVirtualCameras) == nullptr) {
+    options.environment.push_back(std::string(kVirtualCameras) + "=");
+  }
   // Who expects exposures that long expects a helper to be busy with them that long.
   options.silence = std::max(options.silence, timeout() + kSilenceBeyondTimeout);
   _startedAt = Clock::now();
@@ -186,7 +191,7 @@ Camera Link::choose(const Take& take) {
 }
 
 void Link::failWithoutCamera() const {
-  if (_cameras.empty()) throw Failure{kNoCamera, "there is no camera"};
+  if (_cameras.empty()) throw Failure{kNoCamera, "there is no camera (with --virtual there is one to try things out)"};
   if (_chosen) throw Failure{kNoCamera, _chosen->name + " has not come back"};
   std::string known;
   for (const auto& [id, name] : _cameras) {

@@ -26,7 +26,8 @@ struct Options {
   std::optional<int> count;
   std::optional<std::chrono::milliseconds> every;
   std::optional<std::chrono::milliseconds> timeout;
-  std::string camera;     // id or name; "" for any
+  std::string camera;  // id or name; "" for any
+  bool virtualCamera = false;
   std::string helper;     // "" for the one beside the command
   std::string helperLog;  // "" to drop what the helper logs, "-" for standard error
   std::string send;       // a request to send

@@ -1,7 +1,7 @@
 // The loadable module: its one exported function, in front of a model that a folder feeds.
 //
-// TETHER_VIRTUAL_CAMERAS names the folder (see FolderFeed.h). Without it there is one camera, id 1, "Virtual Camera",
-// that makes its own pictures.
+// TETHER_VIRTUAL_CAMERAS names the folder (see FolderFeed.h). Where it is empty there is one camera, id 1, "Virtual
+// Camera", that makes its own pictures; where it is not set there is none.
 #include <cstdlib>
 #include <optional>
 
@@ -22,7 +22,8 @@ const char* const kName = "Virtual Camera";
 struct Plugin {
   Plugin() {
     const char* folder = std::getenv("TETHER_VIRTUAL_CAMERAS");
-    if (folder == nullptr || *folder == '\0') {
+    if (folder == nullptr) return;
+    if (*folder == '\0') {
       model.addCamera(1, kName).setMaker([](uint32_t number) { return ownShot(number, kName, false); });
       return;
     }

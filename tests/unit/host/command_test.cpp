@@ -55,7 +55,7 @@ TEST(CommandTest, SaysWhatItIsAskedForAndEndsAsItShould) {
       {"watch --timeout 0", none, 2, "'0' is no number of seconds from 0.001", "^$"},
       {"messages --device 5", none, 2, "--send", "^$"},
       {"list --helper-log /no/such/folder/x", none, 2, "cannot write /no/such/folder/x", "^$"},
-      {"list", none, 3, "there is no camera\n", "^$"},
+      {"list", none, 3, "there is no camera (with --virtual there is one to try things out)\n", "^$"},
       {"settings --camera 258", kSettings, 3, "there is no camera 258; there is 257 (Cam?[2J), 513 (Other)\n", "^$"},
       {"list --timeout 0.3", mute, 4, "the list of cameras took longer than 0.3 s\n", "^$"},
       {"messages --count 1 --timeout 0.2", mute, 4, "fewer messages came than asked for\n", "^$"},
