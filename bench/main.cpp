@@ -5,6 +5,7 @@
 
 #include <array>
 #include <cstdio>
+#include <cstdlib>
 #include <cstring>
 #include <fstream>
 #include <string>
@@ -41,6 +42,8 @@ int main(int argc, char** argv) {
   std::array<char*, 2> options{argv[0], turns.data()};
   int optionCount = options.size();
   benchmark::Initialize(&optionCount, options.data());
+
+  setenv("TETHER_VIRTUAL_CAMERAS", "", 1);  // one camera that makes its own pictures
 
   // Large blocks always come fresh from the system, as for a process that needs one now and then.
   mallopt(M_MMAP_THRESHOLD, 4 << 20);
