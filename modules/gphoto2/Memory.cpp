@@ -108,6 +108,7 @@ std::vector<File> Memory::owed() const {
     if (entry.mark == Mark::Announced) entries.push_back(&entry);
   std::sort(entries.begin(), entries.end(), [](auto* one, auto* other) { return one->order < other->order; });
   std::vector<File> files;
+  files.reserve(entries.size());
   for (const Entry* entry : entries) files.push_back(entry->file);
   return files;
 }
@@ -165,7 +166,7 @@ void Memory::save() {
   const Guard guard(_mutex);
   if (_path.empty()) return;
   std::string text;
-  for (const auto& [parent, folder] : _folders) text += "folder\t" + parent + '\t' + folder + '\n';
+  for (const auto& [parent, folder] : _folders) text.append("folder\t" + parent).append('\t' + folder).append("\n");
   std::vector<const Entry*> entries;
   for (const auto& [path, entry] : _entries) entries.push_back(&entry);
   std::sort(entries.begin(), entries.end(), [](auto* one, auto* other) { return one->order < other->order; });

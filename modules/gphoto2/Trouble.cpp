@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <cctype>
+#include <cerrno>
 #include <filesystem>
 #include <fstream>
 #include <system_error>
@@ -38,7 +39,7 @@ std::string holderOf(const std::string& file) {
     if (!isProcess || id == std::to_string(getpid()) || !holds(it->path(), file)) continue;
     std::string name;
     std::getline(std::ifstream(it->path() / "comm"), name);
-    return name + " (process " + id + ")";
+    return name.append(" (process ").append(id).append(")");
   }
   return {};
 }
@@ -49,8 +50,8 @@ std::string explain(const Address& address, int result, const std::string& words
   const std::string file = deviceFile(address.port);
   if (result == GP_ERROR_IO_USB_CLAIM || result == GP_ERROR_IO_LOCK) {
     const std::string holder = holderOf(file);
-    return "held by " + (holder.empty() ? "another process" : holder) +
-           "; where that is the desktop, `gio mount -s gphoto2` lets go";
+    const std::string who = holder.empty() ? "another process" : holder;
+    return "held by " + who + "; where that is the desktop, `gio mount -s gphoto2` lets go";
   }
   if (!file.empty() && access(file.c_str(), R_OK | W_OK) != 0 && errno == EACCES)
     return "no permission for " + file +

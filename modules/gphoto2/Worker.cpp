@@ -140,6 +140,7 @@ void Worker::unplug() {
   _reader.clear();
   _pairing = {};
   _items.clear();
+  _isDeaf = false;
 }
 
 }  // namespace gphoto2camera

@@ -74,6 +74,7 @@ class Worker : public std::enable_shared_from_this<Worker> {
   Pairing _pairing{};
   Settings _settings{};
   std::map<std::string, uint32_t> _items{};  // the last of each path that was announced
+  bool _isDeaf = false;                      // it has no events
   int _attempts = 0;                         // since it was open
   int _lastFailure = 0;
   std::optional<Time> _lostAt{};

@@ -44,9 +44,14 @@ void Worker::step() {
 // False: the connection is given up. An error may be all that is heard of a picture.
 bool Worker::lookForEvents(int milliseconds) {
   _lastLook = Clock::now();
-  for (int i = 0; i < kMostEvents; ++i) {
+  for (int i = 0; i < kMostEvents && !_isDeaf; ++i) {
     Event event;
     const int result = _device.wait(i == 0 ? milliseconds : 0, event);
+    if (result == GP_ERROR_NOT_SUPPORTED) {
+      log(_name, "does not tell of its pictures; only those that it is told to take are noticed");
+      _isDeaf = true;
+      return true;
+    }
     if (result != GP_OK) return lost("waiting for events: " + _device.words(result)), false;
     if (event.kind == Event::Kind::None) return true;
     if (event.kind == Event::Kind::Added && !arrive(std::move(event.file))) return false;
@@ -72,6 +77,7 @@ void Worker::shoot() {
   const std::string words = _device.words(result);
   if (result != GP_OK) log(_name, "did not take a picture: " + words);
   _shutter->end(result == GP_OK ? int32_t{kNkMAIDResult_NoError} : resultOf(result, words));
+  waited = waited || (result == GP_OK && _isDeaf);
   if (waited || (result != GP_OK && !isThere())) lost(waited ? "it is opened anew to see what it took" : words);
 }
 
