@@ -238,6 +238,7 @@ Parsed parseCommandLine(int argc, char** argv) {
   };
   parsed.subcommand = chosen.get_name();
   parsed.options = values.options;
+  parsed.options.savesPictures = parsed.subcommand == "capture" || parsed.subcommand == "watch";
   parsed.options.every = values.every.get();
   parsed.options.timeout = values.timeout.get();
   if (given("--count")) parsed.options.count = wholeNumber(values.count, 1, kLargestCount);

@@ -56,6 +56,8 @@ void Link::start() {
   options.errorDescriptor = _log.get();
   options.wakeup = _wakeup;
   options.folder = _options.output;
+  // What came while nobody watched is for a command that saves it.
+  if (!_options.savesPictures) options.environment.emplace_back("TETHER_STATE=");
   if (_options.virtualCamera && std::getenv(kVirtualCameras) == nullptr) {
     options.environment.push_back(std::string(kVirtualCameras) + "=");
   }

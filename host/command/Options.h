@@ -27,6 +27,7 @@ struct Options {
   std::optional<std::chrono::milliseconds> every;
   std::optional<std::chrono::milliseconds> timeout;
   std::string camera;  // id or name; "" for any
+  bool savesPictures = false;
   bool virtualCamera = false;
   std::string helper;     // "" for the one beside the command
   std::string helperLog;  // "" to drop what the helper logs, "-" for standard error
