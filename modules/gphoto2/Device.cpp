@@ -9,13 +9,6 @@
 namespace gphoto2camera {
 namespace {
 
-template <auto Free>
-struct FreeWith {
-  template <typename T>
-  void operator()(T* what) const {
-    Free(what);
-  }
-};
 using List = std::unique_ptr<CameraList, FreeWith<gp_list_free>>;
 using Widget = std::unique_ptr<CameraWidget, FreeWith<gp_widget_free>>;
 

@@ -16,13 +16,6 @@ namespace {
 
 using camerakit::Guard;
 
-template <auto Free>
-struct FreeWith {
-  template <typename T>
-  void operator()(T* what) const {
-    Free(what);
-  }
-};
 using PortList = std::unique_ptr<GPPortInfoList, FreeWith<gp_port_info_list_free>>;
 using List = std::unique_ptr<CameraList, FreeWith<gp_list_free>>;
 

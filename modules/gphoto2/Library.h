@@ -15,6 +15,15 @@
 
 namespace gphoto2camera {
 
+// Deletes what the library made: the deleter of a pointer to it.
+template <auto Free>
+struct FreeWith {
+  template <typename T>
+  void operator()(T* what) const {
+    Free(what);
+  }
+};
+
 // What a call was given for messages of the library; used by one thread at a time.
 class Context {
  public:
